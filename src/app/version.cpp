@@ -1,0 +1,3 @@
+namespace vaultora {
+const char* programVersion() { return "0.1"; }
+}  // namespace vaultora

@@ -1,0 +1,124 @@
+#include "crypto/sym_alg.h"
+
+#include <cstring>
+
+namespace vaultora {
+
+cSymAlg::~cSymAlg() = default;
+
+uint32_t cSymAlg::blockSize() const {
+    uint32_t b = 0, k = 0;
+    return GetSizes(b, k) ? b : 0;
+}
+
+Result CbcEncrypt(cSymAlg* alg, const uint8_t* iv, const uint8_t* in, uint8_t* out, int32_t length) {
+    uint32_t b = 0, k = 0;
+    if (alg == nullptr || !alg->GetSizes(b, k)) return kCipherSizes;
+    if (b == 0 || length < 0 || length % static_cast<int32_t>(b) != 0) return kNotBlockMultiple;
+    SecureBytes chain(b);
+    if (iv != nullptr) std::memcpy(chain.data(), iv, b);
+    for (int32_t off = 0; off < length; off += static_cast<int32_t>(b)) {
+        for (uint32_t i = 0; i < b; ++i) chain[i] ^= in[off + i];
+        if (Result rc = alg->EncryptBlocks(chain.data(), out + off, static_cast<int32_t>(b)); rc != kOk) return rc;
+        std::memcpy(chain.data(), out + off, b);
+    }
+    return kOk;
+}
+
+Result CbcDecrypt(cSymAlg* alg, const uint8_t* iv, const uint8_t* in, uint8_t* out, int32_t length) {
+    uint32_t b = 0, k = 0;
+    if (alg == nullptr || !alg->GetSizes(b, k)) return kCipherSizes;
+    if (b == 0 || length < 0 || length % static_cast<int32_t>(b) != 0) return kNotBlockMultiple;
+    SecureBytes prev(b), cur(b), plain(b);
+    if (iv != nullptr) std::memcpy(prev.data(), iv, b);
+    for (int32_t off = 0; off < length; off += static_cast<int32_t>(b)) {
+        std::memcpy(cur.data(), in + off, b);  // keep the ciphertext: in and out may alias
+        if (Result rc = alg->DecryptBlocks(cur.data(), plain.data(), static_cast<int32_t>(b)); rc != kOk) return rc;
+        for (uint32_t i = 0; i < b; ++i) out[off + i] = plain[i] ^ prev[i];
+        prev.swap(cur);
+    }
+    return kOk;
+}
+
+Result CfbStart(cSymAlg* alg, const uint8_t* iv) {
+    uint32_t b = 0, k = 0;
+    if (alg == nullptr || !alg->GetSizes(b, k)) return kCipherSizes;
+    if (b == 0) return kNotBlockMultiple;
+    alg->m_feedback.assign(b, 0);
+    alg->m_scratch.assign(b, 0);
+    if (iv != nullptr) std::memcpy(alg->m_feedback.data(), iv, b);
+    alg->m_cfbPosition = 0;
+    return kOk;
+}
+
+namespace {
+Result cfbRun(cSymAlg* alg, const uint8_t* in, uint8_t* out, int32_t length, bool decrypt) {
+    uint32_t b = 0, k = 0;
+    if (alg == nullptr || !alg->GetSizes(b, k)) return kCipherSizes;
+    if (b == 0) return kNotBlockMultiple;
+    if (alg->m_feedback.size() != b) return kCipherBuffers;
+    for (int32_t i = 0; i < length; ++i) {
+        uint32_t pos = static_cast<uint32_t>(alg->m_cfbPosition) % b;
+        if (pos == 0) {
+            std::memcpy(alg->m_scratch.data(), alg->m_feedback.data(), b);
+            if (Result rc = alg->EncryptBlocks(alg->m_scratch.data(), alg->m_feedback.data(), static_cast<int32_t>(b));
+                rc != kOk)
+                return rc;
+        }
+        uint8_t c = in[i];
+        uint8_t o = static_cast<uint8_t>(c ^ alg->m_feedback[pos]);
+        alg->m_feedback[pos] = decrypt ? c : o;
+        out[i] = o;
+        alg->m_cfbPosition = static_cast<int32_t>(pos + 1);
+    }
+    return kOk;
+}
+}  // namespace
+
+Result CfbEncrypt(cSymAlg* alg, const uint8_t* in, uint8_t* out, int32_t length) {
+    return cfbRun(alg, in, out, length, false);
+}
+
+Result CfbDecrypt(cSymAlg* alg, const uint8_t* in, uint8_t* out, int32_t length) {
+    return cfbRun(alg, in, out, length, true);
+}
+
+Result ClusterCipher::clusterIv(uint32_t n, SecureBytes& iv) const {
+    uint32_t b = blockSize();
+    iv.assign(b, 0);
+    if (b >= 1 && m_ivTable.size() >= b) {
+        size_t blocks = m_ivTable.size() / b;
+        std::memcpy(iv.data(), m_ivTable.data() + (n % blocks) * b, b);
+    }
+    if (b < 4) return kInconsistent;
+    for (int i = 0; i < 4; ++i) iv[i] ^= static_cast<uint8_t>(n >> (8 * i));
+    return kOk;
+}
+
+bool ClusterCipher::Encrypt(uint32_t n, uint8_t* out, const uint8_t* in, uint32_t length) {
+    if (!hasCipher()) {
+        if (out != in) std::memmove(out, in, length);
+        return true;
+    }
+    SecureBytes iv;
+    if (clusterIv(n, iv) != kOk) return false;
+    return CbcEncrypt(m_alg.get(), iv.data(), in, out, static_cast<int32_t>(length)) == kOk;
+}
+
+bool ClusterCipher::Decrypt(uint32_t n, uint8_t* out, const uint8_t* in, uint32_t length) {
+    if (!hasCipher()) {
+        if (out != in) std::memmove(out, in, length);
+        return true;
+    }
+    SecureBytes iv;
+    if (clusterIv(n, iv) != kOk) return false;
+    return CbcDecrypt(m_alg.get(), iv.data(), in, out, static_cast<int32_t>(length)) == kOk;
+}
+
+Result ClusterCipher::CfbStartForCluster(uint32_t n) {
+    SecureBytes iv;
+    if (Result rc = clusterIv(n, iv); rc != kOk) return rc;
+    return CfbStart(m_alg.get(), iv.data());
+}
+
+}  // namespace vaultora

@@ -1,0 +1,1 @@
+// Compacting lives here.

@@ -1,0 +1,78 @@
+#include "platform/messages.h"
+
+#include <map>
+#include <mutex>
+
+namespace vaultora {
+
+namespace {
+
+struct Entry {
+    Msg id;
+    const char16_t* text;
+};
+
+const Entry kTable[] = {
+    {Msg::kCaptionVaultora, u"Vaultora"},
+    {Msg::kCaptionAttention, u"Attention!"},
+    {Msg::kCaptionError, u"Vaultora Error"},
+    {Msg::kFileAlreadyExists, u"File '%s'\nAlready exists!"},
+    {Msg::kExtendedKeyBlockCorrupted, u"Extended key block is corrupted\nArchive name '%s'"},
+    {Msg::kPasswordInvalid, u"The password you entered is invalid"},
+    {Msg::kClusterLost,
+     u"Cluster information is lost!\nCluster number %d\nTotal clusters %d\n\nDo you want to skip the cluster and "
+     u"continue reading?"},
+    {Msg::kErrorSettingFilePointer, u"Error in setting file pointer"},
+    {Msg::kSeekErrorDetail, u"Cluster %X, \nOffset %X %X\nFile: '%s'"},
+    {Msg::kWritingClusterFile, u"Writing cluster file %d to archive"},
+    {Msg::kMasterKeyCopyExists,
+     u"Master key block copy exists in temporary directory.\nPress Yes button to use the temporary copy to open "
+     u"archive\nOr press No button to use archive internal master key block."},
+    {Msg::kWriteMasterKeyBack, u"Do you want to write temporary master key block back to archive?"},
+    {Msg::kErrorCreatingDirectory, u"Error '%s' in creating directory.\nPath: '%s'"},
+    {Msg::kErrorNumber, u"Error number %d"},
+    {Msg::kErrorNote, u"Error %d, File %s, line %d"},
+    {Msg::kInvalidTime, u"Invalid"},
+    {Msg::kOpenVersionOld,
+     u"Application version is old for the archive.\nPlease download the latest version of Vaultora from the "
+     u"maker's download page."},
+    {Msg::kOpenInUse,
+     u"Error in opening archive\nFile name: '%s'\nThe process cannot access the file because \nit is being used by "
+     u"another process."},
+    {Msg::kOpenWriteError,
+     u"Error in writing archive\nFile name: '%s'\nPlease check if you have write access to the folder."},
+    {Msg::kOpenSecretKeyMissing, u"Corresponding secret key was not found in data base"},
+    {Msg::kOpenError, u"Error %d  in opening archive."},
+    {Msg::kUsageCaption, u"Usage"},
+    {Msg::kNotAvailableYet, u"not available yet"},
+    {Msg::kInvalidArgument, u"Invalid argument"},
+};
+
+std::mutex g_mutex;
+MessageTranslator g_translator;
+
+}  // namespace
+
+std::u16string_view msgText(Msg id) {
+    {
+        std::lock_guard<std::mutex> lock(g_mutex);
+        if (g_translator) {
+            thread_local std::u16string translated;
+            if (g_translator(id, translated)) return translated;
+        }
+    }
+    for (const Entry& e : kTable)
+        if (e.id == id) return e.text;
+    return u"";
+}
+
+std::u16string msgFormat(Msg id, std::initializer_list<FormatArg> args) {
+    return formatText(msgText(id), args);
+}
+
+void setMessageTranslator(MessageTranslator t) {
+    std::lock_guard<std::mutex> lock(g_mutex);
+    g_translator = std::move(t);
+}
+
+}  // namespace vaultora

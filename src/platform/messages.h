@@ -1,0 +1,58 @@
+#pragma once
+// The string table: every text the program shows, by number. Where a text has a number of its own
+// that number is used; the others are numbered from 20000 up. All callers fetch texts through
+// msgText/msgFormat, so a translation can later replace them in one place.
+#include <cstdint>
+#include <functional>
+#include <initializer_list>
+#include <string>
+#include <string_view>
+
+#include "platform/text.h"
+
+namespace vaultora {
+
+enum class Msg : uint32_t {
+    kCaptionVaultora = 55,          // "Vaultora"
+    kCaptionAttention = 63,         // "Attention!"
+    kCaptionError = 65,             // "Vaultora Error"
+    kFileAlreadyExists = 162,       // "File '%s'\nAlready exists!"
+
+    // Archive object
+    kExtendedKeyBlockCorrupted = 20000,
+    kPasswordInvalid,
+    kClusterLost,
+    kErrorSettingFilePointer,       // caption
+    kSeekErrorDetail,
+    kWritingClusterFile,
+    kMasterKeyCopyExists,
+    kWriteMasterKeyBack,
+    kErrorCreatingDirectory,
+    kErrorNumber,
+    kErrorNote,                     // "Error %d, File %s, line %d"
+    kInvalidTime,
+    // Open results shown by the shell
+    kOpenVersionOld,
+    kOpenInUse,
+    kOpenWriteError,
+    kOpenSecretKeyMissing,
+    kOpenError,
+    // Command line
+    kUsageText,
+    kUsageCaption,
+    kNotAvailableYet,
+    kInvalidArgument,
+
+    kFirstFree = 21000,  // later additions number from here
+};
+
+// The default-language text of a message ("" for an unknown number).
+std::u16string_view msgText(Msg id);
+// The text formatted printf-style with the arguments.
+std::u16string msgFormat(Msg id, std::initializer_list<FormatArg> args);
+
+// A translation hook: when set, it is asked first and may return a replacement text.
+using MessageTranslator = std::function<bool(Msg id, std::u16string& out)>;
+void setMessageTranslator(MessageTranslator t);
+
+}  // namespace vaultora
