@@ -83,6 +83,24 @@ Result CfbDecrypt(cSymAlg* alg, const uint8_t* in, uint8_t* out, int32_t length)
     return cfbRun(alg, in, out, length, true);
 }
 
+Result CfbResync(cSymAlg* alg) {
+    uint32_t b = 0, k = 0;
+    if (alg == nullptr || !alg->GetSizes(b, k)) return kCipherSizes;
+    if (b == 0) return kNotBlockMultiple;
+    if (alg->m_feedback.size() != b || alg->m_scratch.size() != b) return kCipherBuffers;
+    uint32_t pos = static_cast<uint32_t>(alg->m_cfbPosition) % b;
+    if (pos == 0) return kOk;
+    // The scratch block still holds the previous ciphertext block (the register before it was
+    // encrypted); the register holds the current block's ciphertext in [0, pos). The last b bytes
+    // of ciphertext are therefore scratch[pos..b) followed by register[0..pos).
+    SecureBytes last(b);
+    std::memcpy(last.data(), alg->m_scratch.data() + pos, b - pos);
+    std::memcpy(last.data() + (b - pos), alg->m_feedback.data(), pos);
+    alg->m_feedback.swap(last);
+    alg->m_cfbPosition = 0;
+    return kOk;
+}
+
 Result ClusterCipher::clusterIv(uint32_t n, SecureBytes& iv) const {
     uint32_t b = blockSize();
     iv.assign(b, 0);

@@ -11,6 +11,11 @@ namespace vaultora {
 
 class cSymAlg {
 public:
+    cSymAlg() = default;
+    cSymAlg(const cSymAlg&) = delete;
+    cSymAlg& operator=(const cSymAlg&) = delete;
+    // Wipes the CFB register and scratch block (SecureBytes) and, in the derived classes, the
+    // key schedule.
     virtual ~cSymAlg();
     // False when the object cannot be used. blockSize 0 means "no cipher" (the copy cipher).
     virtual bool GetSizes(uint32_t& blockSize, uint32_t& keySize) const = 0;
@@ -39,6 +44,9 @@ public:
 [[nodiscard]] Result CfbStart(cSymAlg* alg, const uint8_t* iv);
 [[nodiscard]] Result CfbEncrypt(cSymAlg* alg, const uint8_t* in, uint8_t* out, int32_t length);
 [[nodiscard]] Result CfbDecrypt(cSymAlg* alg, const uint8_t* in, uint8_t* out, int32_t length);
+// OpenPGP resynchronisation: the register is realigned so that it holds the last block of
+// ciphertext and the next byte starts a new block. Does nothing at a block boundary.
+[[nodiscard]] Result CfbResync(cSymAlg* alg);
 
 // The archive's record cipher: the cipher of the open archive (absent for an unencrypted one) and
 // the per-cluster IV (the cluster number, little-endian, in the first four bytes of a zero block).

@@ -46,6 +46,24 @@ const Entry kTable[] = {
     {Msg::kUsageCaption, u"Usage"},
     {Msg::kNotAvailableYet, u"not available yet"},
     {Msg::kInvalidArgument, u"Invalid argument"},
+    {Msg::kPasswordAlreadyUsed, u"The same password was already used for the archive."},
+    {Msg::kArchiveNotEncrypted, u"The archive is not encrypted."},
+    {Msg::kEnterPasswordToRemove, u"Enter password to be removed."},
+    {Msg::kSessionKeyNotFound, u"Session key encrypted by the password was not found."},
+    {Msg::kExtendedKeyBlockEmpty, u"Extended key block is empty."},
+    {Msg::kPasswordOpensMasterKey,
+     u"The password you entered is compatible with Master Key,\nMaster Key block cannot be removed."},
+    {Msg::kExtendedKeyBlockCorruptedAdd,
+     u"The extended key block is corrupted!\nArchive name '%s'\nDo you want to clear the corrupted block content "
+     u"and \nadd the new encrypted session key?"},
+    {Msg::kEnterNewPassword, u"Enter new password"},
+    {Msg::kEncryptionParameters, u"Encryption parameters"},
+    {Msg::kPasswordEmpty, u"Password is empty"},
+    {Msg::kPasswordTooShort, u"Password length is too short"},
+    {Msg::kPasswordsMismatch, u"Passwords mismatch"},
+    {Msg::kInvalidSalt, u"Invalid salt value"},
+    {Msg::kKeyBlockCreatingTitle, u"Vaultora: Please wait for key block creating"},
+    {Msg::kKeyBlockArchiveName, u"Archive name: '%s'"},
 };
 
 std::mutex g_mutex;

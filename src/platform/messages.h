@@ -43,6 +43,23 @@ enum class Msg : uint32_t {
     kNotAvailableYet,
     kInvalidArgument,
 
+    // Key blocks and passwords
+    kPasswordAlreadyUsed,
+    kArchiveNotEncrypted,
+    kEnterPasswordToRemove,         // dialog title
+    kSessionKeyNotFound,
+    kExtendedKeyBlockEmpty,
+    kPasswordOpensMasterKey,
+    kExtendedKeyBlockCorruptedAdd,  // question: clear the block and add the new session key?
+    kEnterNewPassword,              // dialog title
+    kEncryptionParameters,          // dialog title
+    kPasswordEmpty,
+    kPasswordTooShort,
+    kPasswordsMismatch,
+    kInvalidSalt,
+    kKeyBlockCreatingTitle,
+    kKeyBlockArchiveName,
+
     kFirstFree = 21000,  // later additions number from here
 };
 

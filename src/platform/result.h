@@ -57,6 +57,16 @@ enum Result : uint32_t {
     kNewerFormat = 109,
     kClusterWriteFailed = 111,
     kCotReadBackDiffers = 114,
+    // Crypto layer: hashes, key derivation and key packets
+    kUnknownHash = 22,             // unknown hash identifier
+    kHashUnavailable = 23,         // hash operation not available
+    kMissingOutput = 29,           // output buffer absent
+    kRandomPoolEmpty = 35,         // random bytes could not be produced
+    kPacketHeader = 36,            // bad packet tag, or old-format header/length past the buffer
+    kPacketLength = 38,            // new-format packet length runs past the buffer
+    kBadS2K = 40,                  // unreadable S2K specifier
+    kUnknownS2KAlg = 48,           // unknown hash or cipher named inside an S2K specifier
+    kZeroKeyLength = 52,           // key derivation asked for zero bytes
 };
 
 }  // namespace vaultora
