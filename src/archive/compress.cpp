@@ -19,11 +19,13 @@ Result compressBuffer(uint8_t* dest, size_t& destLen, const uint8_t* src, size_t
 
 Result decompressBuffer(uint8_t* dest, size_t& destLen, const uint8_t* src, size_t srcLen) {
     uLongf out = destLen;
-    // zlib reports a truncated stream as a data error and a full destination as a buffer error.
-    int z = ::uncompress(dest, &out, src, srcLen);
+    uLong in = srcLen;
+    // A buffer error with all input consumed is a truncated stream (corrupt input); with input
+    // left over, the destination was too small.
+    int z = ::uncompress2(dest, &out, src, &in);
     switch (z) {
         case Z_OK: destLen = out; return kOk;
-        case Z_BUF_ERROR: return kBufferTooSmall;
+        case Z_BUF_ERROR: return in >= srcLen ? kInconsistent : kBufferTooSmall;
         case Z_MEM_ERROR: return kNoMemory;
         case Z_DATA_ERROR: case Z_NEED_DICT: return kInconsistent;
         default: return kCompression;

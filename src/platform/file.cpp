@@ -239,6 +239,18 @@ bool removeTree(const std::string& path) {
     return removeFile(path);
 }
 
+std::vector<std::string> listDirectory(const std::string& path) {
+    std::vector<std::string> names;
+    if (DIR* d = ::opendir(path.c_str())) {
+        while (dirent* e = ::readdir(d)) {
+            std::string n = e->d_name;
+            if (n != "." && n != "..") names.push_back(n);
+        }
+        ::closedir(d);
+    }
+    return names;
+}
+
 bool copyFile(const std::string& from, const std::string& to) {
     std::vector<uint8_t> data;
     if (!readWholeFile(from, data)) return false;

@@ -80,6 +80,8 @@ bool createDirectories(const std::string& path, unsigned mode = 0700);
 // Removes a folder and everything in it; true when it is gone.
 bool removeTree(const std::string& path);
 bool copyFile(const std::string& from, const std::string& to);
+// Names in a folder (without "." and ".."); empty when it cannot be read.
+std::vector<std::string> listDirectory(const std::string& path);
 // Creates or truncates the file, writes the bytes and syncs them.
 bool writeWholeFile(const std::string& path, const void* data, size_t n);
 bool readWholeFile(const std::string& path, std::vector<uint8_t>& out);
