@@ -1,6 +1,40 @@
-#include <cstdio>
+// The vaultora program: builds the argument vector, reads the options and runs one verb.
+#include <string>
+#include <vector>
 
-int main(int, char**) {
-    std::puts("vaultora");
-    return 0;
+#include "app/cmdline.h"
+
+namespace {
+
+using vaultora::CommandTable;
+using vaultora::Verb;
+
+// The place where each verb gets its handler. Until a verb is built its row keeps the
+// "not available yet" placeholder; unknown verbs always get the usage text.
+void registerVerbs(CommandTable& table) {
+    // Batch verbs (each runs its dialogs without a window and returns the exit code):
+    //   table.setHandler(Verb::kAdd, runAdd);            // also Verb::kEncrypt
+    //   table.setHandler(Verb::kExtract, runExtract);
+    //   table.setHandler(Verb::kProperties, runProperties);
+    //   table.setHandler(Verb::kDelete, runDelete);
+    //   table.setHandler(Verb::kSend, runSend);
+    //   table.setHandler(Verb::kShowPkid, runShowPkid);
+    //   table.setHandler(Verb::kMakeSelfExtracted, ...); table.setHandler(Verb::kCheckSelfExtracted, ...);
+    //   table.setHandler(Verb::kClipboardAuto / kClipboardDecode / kClipboardEncode, ...);
+    //   table.setHandler(Verb::kShowKeyManager, ...);
+    //
+    // GUI verbs (main window; the hand-over to a process that already holds the archive comes
+    // first for kBareArchive, kOpen and kNew):
+    //   table.setHandler(Verb::kNone, ...);  table.setHandler(Verb::kBareArchive, ...);
+    //   table.setHandler(Verb::kOpen, ...);  table.setHandler(Verb::kNew, ...);
+    (void)table;
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+    std::vector<std::string> args(argv, argv + argc);  // element 0 is the program path
+    CommandTable table;
+    registerVerbs(table);
+    return vaultora::runCommandLine(std::move(args), table);
 }
