@@ -286,7 +286,23 @@ Result Vaultora::loadClusterTable() {
     Result rc = decodeCotRecord(record.data(), record.size(), blockSize(), m_cipher, table);
     if (rc != kOk) return rc == kInconsistent ? errorNote(rc, "HXZip", __LINE__) : rc;
     m_cot = std::move(table);
+    m_storedCot = std::move(record);
     m_dataEnd = m_header.cotOffset;
+    if (!m_readOnly && fs::isDirectory(m_tempFolder)) return finishLeftoverFolder();
+    return kOk;
+}
+
+Result Vaultora::finishLeftoverFolder() {
+    // The archive's own table was used, so nothing in the temporary folder belongs to it except a
+    // key block copy: cluster files and table copies there are what an interrupted run left
+    // before it saved any table.
+    for (const std::string& n : fs::listDirectory(m_tempFolder.substr(0, m_tempFolder.size() - 1))) {
+        if (n == kMasterCopyFile || n == kExtendedCopyFile) continue;
+        fs::removeTree(m_tempFolder + n);
+    }
+    // A newer extended key block waits in its copy: the commit at close writes it.
+    if (fs::exists(crashPath(kExtendedCopyFile))) return markModified();
+    if (!fs::exists(crashPath(kMasterCopyFile))) fs::removeTree(m_tempFolder.substr(0, m_tempFolder.size() - 1));
     return kOk;
 }
 
@@ -333,6 +349,7 @@ Result Vaultora::close() {
     }
     m_cache.clear();
     m_cot.clear();
+    m_storedCot.clear();
     m_masterKeyCopy.clear();
     m_useMasterKeyCopy = false;
     m_crashPathsBuilt = false;
@@ -492,10 +509,13 @@ Result Vaultora::markModified() {
     backupExtendedKeyBlock();
     m_modified = true;
     m_clean = false;
-    // Keep the table that the archive holds now: what is written next lands on top of it.
+    // Keep the table that the archive holds now, as it was stored (clusters allocated since are
+    // not in it): what is written next lands on top of it.
     if (!fs::exists(crashPath(kCotFile))) {
-        std::vector<uint8_t> record;
-        if (Result rc = encodeCotRecord(m_cot, blockSize(), m_cipher, record); rc != kOk) return rc;
+        std::vector<uint8_t> record = m_storedCot;
+        if (record.empty()) {
+            if (Result rc = encodeCotRecord(m_cot, blockSize(), m_cipher, record); rc != kOk) return rc;
+        }
         if (Result rc = writeCotCopy(record); rc != kOk) return rc;
     }
     return kOk;
@@ -732,6 +752,7 @@ Result Vaultora::saveClusterTable(uint64_t position) {
         if (!(a == b)) return kCotReadBackDiffers;
     }
     m_dataEnd = position;
+    m_storedCot = std::move(record);
     return saveHeader();
 }
 

@@ -157,6 +157,7 @@ private:
     Result loadCotFrom(const std::string& path);
     Result computeHeaderCheck(cSymAlg* cipher, std::array<uint8_t, 20>& out) const;
     void repairInterruptedClusterFiles();
+    Result finishLeftoverFolder();
     void deletePendingClusterFiles();
     void writeBackMasterKeyCopy();
 
@@ -171,6 +172,7 @@ private:
     SecureBytes m_archiveKey;
     ClusterCipher m_cipher;
     std::vector<CotEntry> m_cot;
+    std::vector<uint8_t> m_storedCot;  // the table record as the archive holds it
     DirectoryCache m_cache;
     bool m_crashPathsBuilt = false;
     bool m_useMasterKeyCopy = false;
