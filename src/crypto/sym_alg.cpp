@@ -1,5 +1,6 @@
 #include "crypto/sym_alg.h"
 
+#include <algorithm>
 #include <cstring>
 
 namespace vaultora {
@@ -19,23 +20,29 @@ Result CbcEncrypt(cSymAlg* alg, const uint8_t* iv, const uint8_t* in, uint8_t* o
     if (iv != nullptr) std::memcpy(chain.data(), iv, b);
     for (int32_t off = 0; off < length; off += static_cast<int32_t>(b)) {
         for (uint32_t i = 0; i < b; ++i) chain[i] ^= in[off + i];
-        if (Result rc = alg->EncryptBlocks(chain.data(), out + off, static_cast<int32_t>(b)); rc != kOk) return rc;
-        std::memcpy(chain.data(), out + off, b);
+        if (Result rc = alg->EncryptBlocks(chain.data(), chain.data(), static_cast<int32_t>(b)); rc != kOk) return rc;
+        std::memcpy(out + off, chain.data(), b);
     }
     return kOk;
 }
 
+// Decrypts in pieces of several blocks, so that the cipher can work on many blocks per call; the
+// ciphertext of each piece is kept aside first, since in and out may be the same buffer.
 Result CbcDecrypt(cSymAlg* alg, const uint8_t* iv, const uint8_t* in, uint8_t* out, int32_t length) {
     uint32_t b = 0, k = 0;
     if (alg == nullptr || !alg->GetSizes(b, k)) return kCipherSizes;
     if (b == 0 || length < 0 || length % static_cast<int32_t>(b) != 0) return kNotBlockMultiple;
-    SecureBytes prev(b), cur(b), plain(b);
+    const size_t piece = std::max<size_t>(b, (4096 / b) * b);
+    SecureBytes prev(b), cipher(std::min<size_t>(piece, static_cast<size_t>(length)));
     if (iv != nullptr) std::memcpy(prev.data(), iv, b);
-    for (int32_t off = 0; off < length; off += static_cast<int32_t>(b)) {
-        std::memcpy(cur.data(), in + off, b);  // keep the ciphertext: in and out may alias
-        if (Result rc = alg->DecryptBlocks(cur.data(), plain.data(), static_cast<int32_t>(b)); rc != kOk) return rc;
-        for (uint32_t i = 0; i < b; ++i) out[off + i] = plain[i] ^ prev[i];
-        prev.swap(cur);
+    for (size_t off = 0; off < static_cast<size_t>(length);) {
+        const size_t n = std::min(piece, static_cast<size_t>(length) - off);
+        std::memcpy(cipher.data(), in + off, n);
+        if (Result rc = alg->DecryptBlocks(cipher.data(), out + off, static_cast<int32_t>(n)); rc != kOk) return rc;
+        for (uint32_t i = 0; i < b; ++i) out[off + i] ^= prev[i];
+        for (size_t i = b; i < n; ++i) out[off + i] ^= cipher[i - b];
+        std::memcpy(prev.data(), cipher.data() + n - b, b);
+        off += n;
     }
     return kOk;
 }
