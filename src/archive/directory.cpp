@@ -32,8 +32,6 @@ bool matchRecord(const uint8_t* record, size_t nameLength, std::u16string_view p
     return p == pattern.size();
 }
 
-bool isFolderRecord(const uint8_t* r) { return (unit::attributes(r) & kAttrFolder) != 0; }
-
 Result readChainCluster(Vaultora& a, uint32_t c, ChainBuffer& buffer) {
     buffer.cluster = c;
     return a.readCluster(buffer);

@@ -4,7 +4,7 @@
 #include <cstring>
 
 #include "archive/directory.h"
-#include "crypto/sym_alg.h"
+#include "crypto/sym_alg_table.h"
 #include "platform/disk_names.h"
 #include "platform/messages.h"
 #include "platform/text.h"
@@ -298,13 +298,10 @@ Result showArchiveStatistics(Vaultora& a, std::u16string& text, std::u16string& 
     const Header& h = a.header();
     const uint64_t compressed = static_cast<uint64_t>(h.embeddedOffset) + h.dataOffset + h.cotLength + count.compressedSize;
     const unsigned ratio = count.realSize == 0 ? 0u : static_cast<unsigned>(count.compressedSize * 100 / count.realSize);
-    std::u16string algorithm;
-    cSymAlg* alg = a.recordCipher().alg();
-    if (alg == nullptr) {
-        algorithm = msgFormat(Msg::kAlgorithmBits, {msgText(Msg::kCipherUndefined), static_cast<unsigned>(a.archiveKey().size() * 8)});
-    } else {
-        algorithm = msgFormat(Msg::kAlgorithmBits, {fromUtf8(alg->name()), static_cast<unsigned>(a.archiveKey().size() * 8)});
-    }
+    const char* cipherName = a.recordCipher().hasCipher() ? SymAlgName(a.cipherId()) : nullptr;
+    const std::u16string name = cipherName != nullptr ? fromUtf8(cipherName) : std::u16string(msgText(Msg::kCipherUndefined));
+    const std::u16string algorithm =
+        msgFormat(Msg::kAlgorithmBits, {name, static_cast<unsigned>(a.archiveKey().size() * 8)});
     text = msgFormat(Msg::kArchiveStatistics, {fromUtf8(a.path()), algorithm, count.files, count.folders,
                                                sizeText(count.realSize), sizeText(compressed), ratio});
     text += u'\n';
