@@ -119,6 +119,79 @@ const Entry kTable[] = {
     {Msg::kInvalidSalt, u"Invalid salt value"},
     {Msg::kKeyBlockCreatingTitle, u"Vaultora: Please wait for key block creating"},
     {Msg::kKeyBlockArchiveName, u"Archive name: '%s'"},
+    {Msg::kErrorWritingNoSpace,
+     u"Error in writing file.\n\nFile  '%s'\ncannot be added to archive  '%s'\nbecause there is not enough space on "
+     u"the disk.\n\nPlease free additional space on the drive and use the Retry button to add the file.\nOr use the "
+     u"Ignore button to skip the file."},
+    {Msg::kErrorReadingRetry,
+     u"Error in reading file\n '%s'.\n\nThe file may be busied by an application,\nplease close the application and "
+     u"press the Retry button read the file again.\nUse the Ignore button to skip the file and continue the "
+     u"operation."},
+    {Msg::kFileOverFolder, u"You are copying file \n%s to archive.\nBut the archive contains a directory with same name."},
+    {Msg::kCaptionAddFile, u"Add File"},
+    {Msg::kStreamQuestionAdd,
+     u"Vaultora has encountered an NTFS file system Alternate Data Stream\n '%s'\nin the file\n '%s'\n\nNote to user: "
+     u"Alternate Data Streams are only supported on Windows NTFS file systems.\n\nDo you want to copy this Alternate "
+     u"Data Stream into the archive?"},
+    {Msg::kArchiveContainsFile, u"The archive already contains file\n%s\n\nOverwrite existing file?"},
+    {Msg::kProcessTerminate,
+     u"Process %s will be terminated.\nPress Yes button to confirm termination.\nPress No button to continue the "
+     u"process."},
+    {Msg::kInputDataCorrupted, u"Input data is corrupted"},
+    {Msg::kCaptionExportFile, u"Export file"},
+    {Msg::kCaptionImportFile, u"Import file"},
+    {Msg::kAddFilesToArchive, u"Add files to archive"},
+    {Msg::kExtractFileTitle, u"Extract file from archive"},
+    {Msg::kArchiveStatistics,
+     u"Archive %s\nEncryption algorithm: %s\nFiles %d\nFolders %d\nReal size %s\nCompressed size %s\nRatio %d%%"},
+    {Msg::kFileFormatVersion, u"File format v.%d.%d"},
+    {Msg::kAlgorithmBits, u"%s %d bits"},
+    {Msg::kCipherUndefined, u"Undefined"},
+    {Msg::kArchiveStatisticCaption, u"Archive statistic"},
+    {Msg::kDiskFileExists, u"File %s\nalready exists.\n\nOverwrite existing file?"},
+    {Msg::kRemoveFromArchive,
+     u"File/folder '%s'\nwill be removed from archive.\n\nPress Cancel button to terminate the operation.\nPress No "
+     u"button to skip removing the file.\nPress Yes button to confirm removing.\n"},
+    {Msg::kImportLacksSubfolder,
+     u"Import folder '%s'\ndoes not contain subfolder'%s'\nDo you want to remove subfolder '%s' from archive?"},
+    {Msg::kImportLacksFile, u"Import folder '%s'\ndoes not contain file '%s'\nDo you want to remove file '%s' from archive?"},
+    {Msg::kExternalSame, u"External version is same"},
+    {Msg::kExternalLater, u"External version is later"},
+    {Msg::kExportDateEarly,
+     u"Exported file date is early than date of file on disk.\nFile on disk:\n Date: %s, Size: %s, Path: '%s'\nFile in "
+     u"archive:\n Date: %s, Size: %s, Path: '%s'\n\nDo you want to overwrite file on disk?"},
+    {Msg::kReadOnlyTarget, u"File '%s'\nis a read-only file.\n\nAre you sure you want to delete it?"},
+    {Msg::kStreamQuestionExtract,
+     u"Vaultora has encountered an NTFS file system Alternate Data Stream:\n '%s'\nin file:\n '%s'\nbut the "
+     u"destination file system does not support Alternate Data Streams.\n\nDo you want to extract this stream as a "
+     u"separate non-ADS file:\n '%s'\nto destination folder:\n '%s'?"},
+    {Msg::kErrorExtracting, u"Error in extracting file\n '%s'\n\nDo you want to continue extracting?"},
+    {Msg::kExtracted, u"extracted"},
+    {Msg::kErrorCode, u"Error %d"},
+    {Msg::kSizeUnitB, u"B"},
+    {Msg::kSizeUnitKB, u"KB"},
+    {Msg::kSizeUnitMB, u"MB"},
+    {Msg::kSizeUnitGB, u"GB"},
+    {Msg::kSizeUnitTB, u"TB"},
+    {Msg::kSourceNotFound, u"Source file not found - "},
+    {Msg::kErrorReadingSkipped, u"Error in reading file '%s'. File is skipped!"},
+    {Msg::kFileSkippedCollected, u"File '%s' is skipped"},
+    {Msg::kErrorReadingDirectory, u"Error in reading directory"},
+    {Msg::kArchiveLacksExported, u"Archive does not contains exported file"},
+    {Msg::kExportedNotInArchive, u"Exported file '%s'\nis not found in archive.\n\nDo you want to delete file on disk?"},
+    {Msg::kExportedWiped, u"Exported file is wiped."},
+    {Msg::kExportedWipeSkipped, u"Exported file wipipng is skipped."},
+    {Msg::kArchiveLatest, u"Archive contains latest version"},
+    {Msg::kImportDateEarly,
+     u"Imported file date is early than date of file in archive.\nFile on disk:\n Date: %s, Size: %s, Path: '%s'\nFile "
+     u"in archive:\n Date: %s, Size: %s, Path: '%s'\n\nDo you want to overwrite archive file?"},
+    {Msg::kSameBodySkipped, u"File inside archive has same body as source file '%s'. File is skipped."},
+    {Msg::kSkipped, u"Skipped"},
+    {Msg::kAdded, u"added"},
+    {Msg::kHeldForWriting, u"File '%s' is opened for write access by other applicaton."},
+    {Msg::kHeldWrittenAnyway, u" Is written to archive."},
+    {Msg::kHeldWriteAnyway, u"\n\nDo you want to write this file anyway?"},
+    {Msg::kCaptionWarning, u"Warning!"},
 };
 
 std::mutex g_mutex;

@@ -60,6 +60,60 @@ enum class Msg : uint32_t {
     kKeyBlockCreatingTitle,
     kKeyBlockArchiveName,
 
+    // Directory tree, walks and extraction
+    kErrorWritingNoSpace = 43,      // "Error in writing file.\n\nFile  '%s'..." (Retry/Ignore)
+    kErrorReadingRetry = 44,        // "Error in reading file\n '%s'...." (Retry/Ignore)
+    kFileOverFolder = 60,           // "You are copying file \n%s to archive...."
+    kCaptionAddFile = 61,           // "Add File"
+    kStreamQuestionAdd = 62,        // alternate data stream met while adding
+    kArchiveContainsFile = 67,      // "The archive already contains file\n%s\n\nOverwrite existing file?"
+    kProcessTerminate = 78,         // "Process %s will be terminated...."
+    kInputDataCorrupted = 125,      // "Input data is corrupted"
+    kCaptionExportFile = 221,       // "Export file"
+    kCaptionImportFile = 222,       // "Import file"
+    kAddFilesToArchive = 257,       // "Add files to archive"
+    kExtractFileTitle = 20400,
+    kArchiveStatistics,
+    kFileFormatVersion,
+    kAlgorithmBits,
+    kCipherUndefined,
+    kArchiveStatisticCaption,
+    kDiskFileExists,                // "File %s\nalready exists.\n\nOverwrite existing file?"
+    kRemoveFromArchive,
+    kImportLacksSubfolder,
+    kImportLacksFile,
+    kExternalSame,
+    kExternalLater,
+    kExportDateEarly,
+    kReadOnlyTarget,
+    kStreamQuestionExtract,
+    kErrorExtracting,
+    kExtracted,
+    kErrorCode,                     // "Error %d"
+    kSizeUnitB,
+    kSizeUnitKB,
+    kSizeUnitMB,
+    kSizeUnitGB,
+    kSizeUnitTB,
+    // Adding
+    kSourceNotFound,
+    kErrorReadingSkipped,
+    kFileSkippedCollected,
+    kErrorReadingDirectory,
+    kArchiveLacksExported,
+    kExportedNotInArchive,
+    kExportedWiped,
+    kExportedWipeSkipped,
+    kArchiveLatest,
+    kImportDateEarly,
+    kSameBodySkipped,
+    kSkipped,
+    kAdded,
+    kHeldForWriting,
+    kHeldWrittenAnyway,
+    kHeldWriteAnyway,
+    kCaptionWarning,
+
     kFirstFree = 21000,  // later additions number from here
 };
 

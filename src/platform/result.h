@@ -67,6 +67,13 @@ enum Result : uint32_t {
     kBadS2K = 40,                  // unreadable S2K specifier
     kUnknownS2KAlg = 48,           // unknown hash or cipher named inside an S2K specifier
     kZeroKeyLength = 52,           // key derivation asked for zero bytes
+    // Directory tree, walks and adding
+    kDirectoryUnusable = 74,       // a folder's directory cannot be read, or a unit cannot be removed
+    kArchiveReadOnly = 103,        // the archive is open read-only
+    kOwnerFound = 110,             // a walk found the unit it looked for and stops
+    kSkippedByAnswer = 112,        // the user answered No (the item is skipped)
+    kSkippedAllByAnswer = 113,     // the user answered No to all
+    kUnexpectedAnswer = 115,       // an answer none of the branches expects
 };
 
 }  // namespace vaultora
