@@ -41,7 +41,7 @@
 #include <cstring>
 #include <ctime>
 
-#include "crypto/hash_alg.h"
+#include "crypto/key_block.h"
 #include "platform/messages.h"
 #include "platform/text.h"
 
@@ -222,11 +222,16 @@ Result Vaultora::open(const OpenKey& key) {
         if (Result r = computeHeaderCheck(nullptr, check); r != kOk) return r;
         if (check != m_header.headerCheck) return kWrongPassword;
     } else {
-        if (g_hooks.openKeyBlocks == nullptr) return kNotApplicable;
-        rc = g_hooks.openKeyBlocks(*this, blocks, masterLength, key, false);
+        KeyMaterial material;
+        material.password = key.password;
+        const std::array<uint8_t, 68> image = m_header.encode();
+        ArchiveKey found;
+        rc = OpenKeyBlocks(blocks.data(), blocks.size(), masterLength, material, image.data(), false, found);
         if (rc == kWrongPassword || rc == kNotApplicable || rc == kKeyBlock39)
-            rc = g_hooks.openKeyBlocks(*this, blocks, masterLength, key, true);
+            rc = OpenKeyBlocks(blocks.data(), blocks.size(), masterLength, material, image.data(), true, found);
         if (rc != kOk) return rc;
+        if (found.cipher != nullptr && found.cipher->blockSize() > m_header.blockSize) return kInconsistent;
+        setRecordCipher(found.cipherId, std::move(found.key), ClusterCipher(std::move(found.cipher)));
     }
 
     rc = loadClusterTable();
@@ -414,17 +419,9 @@ Result Vaultora::create(const uint8_t* masterBlock, size_t masterLength) {
 }
 
 Result Vaultora::computeHeaderCheck(cSymAlg* cipher, std::array<uint8_t, 20>& out) const {
-    std::array<uint8_t, 68> image = m_header.encode();
-    std::vector<uint8_t> digest;
-    if (Result rc = HashBuffer(kHashSha1, image.data(), 40, digest); rc != kOk) return rc;
-    if (digest.size() != 20) return kInconsistent;
+    const std::array<uint8_t, 68> image = m_header.encode();
     cSymAlg* alg = cipher != nullptr ? cipher : m_cipher.alg();
-    if (alg != nullptr && alg->blockSize() != 0) {
-        if (Result rc = CfbStart(alg, nullptr); rc != kOk) return rc;
-        if (Result rc = CfbEncrypt(alg, digest.data(), digest.data(), 20); rc != kOk) return rc;
-    }
-    std::copy(digest.begin(), digest.end(), out.begin());
-    return kOk;
+    return ComputeHeaderCheck(image.data(), alg, out.data());
 }
 
 // ---------------------------------------------------------------------------------------------

@@ -29,10 +29,6 @@ struct OpenKey {
 struct ArchiveHooks {
     Result (*compact)(Vaultora& archive, bool force) = nullptr;
     Result (*offerRecovery)(Vaultora& archive, Result loadResult) = nullptr;
-    // Opens the key blocks: sets cipher id, key and record cipher, checks the header. When null,
-    // only archives without key blocks open.
-    Result (*openKeyBlocks)(Vaultora& archive, const SecureBytes& blocks, size_t masterLength, const OpenKey& key,
-                            bool alternativeMode) = nullptr;
 };
 void setArchiveHooks(const ArchiveHooks& hooks);
 const ArchiveHooks& archiveHooks();
