@@ -174,7 +174,7 @@ int showUsage(const Invocation&) {
 }
 
 int verbNotAvailable(const Invocation& call) {
-    writeOut(stderr, "vaultora: " + std::string(verbName(call.verb)) + ": " +
+    writeOut(stderr, std::string(verbName(call.verb)) + ": " +
                          toUtf8(msgText(Msg::kNotAvailableYet)) + "\n");
     return kExitFailure;
 }

@@ -86,7 +86,7 @@ using VerbHandler = std::function<int(const Invocation&)>;
 
 // Exit codes of the start-up itself (-1 and -2 are the exit statuses 255 and 254).
 inline constexpr int kExitFailure = -1;
-inline constexpr int kExitNotFound = -2;
+inline constexpr int kExitUnusable = -2;  // "checkSelfExtracted" found no usable base
 inline constexpr int kExitTooFewArguments = 104;
 
 // The command table. Every verb starts as "not available yet" (a line on standard error naming

@@ -250,7 +250,7 @@ TEST(CommandLineProgram, UnknownVerbPrintsUsageAndExitsMinusOne) {
     EXPECT_TRUE(r.err.empty());
 }
 
-TEST(CommandLineProgram, VerbsNotBuiltYetSayso) {
+TEST(CommandLineProgram, PlaceholdersMissingArgumentsAndExitStatuses) {
     RunResult r = runProgram({"extract", "a.vra", "dest", "-LF", "log.txt"});
     EXPECT_EQ(r.status, 255);
     EXPECT_TRUE(r.out.empty());
@@ -265,10 +265,8 @@ TEST(CommandLineProgram, VerbsNotBuiltYetSayso) {
     r = runProgram({"a.vra"}, dir.path());
     EXPECT_EQ(r.status, 255);
     EXPECT_NE(r.err.find("archive: not available yet"), std::string::npos) << r.err;
-}
 
-TEST(CommandLineProgram, MissingArgumentsGiveUsageOrInvalidArgument) {
-    RunResult r = runProgram({"Open"});
+    r = runProgram({"Open"});
     EXPECT_EQ(r.status, 255);
     EXPECT_EQ(r.out, usageText());
 
@@ -281,6 +279,7 @@ TEST(CommandLineProgram, MissingArgumentsGiveUsageOrInvalidArgument) {
     EXPECT_NE(r.err.find("Invalid argument"), std::string::npos);
     EXPECT_TRUE(r.out.empty());
 }
+
 
 }  // namespace
 }  // namespace vaultora

@@ -49,39 +49,37 @@ TEST_F(SettingsTest, WritesEachTypeInRegistryExportFormatAndReadsItBack) {
     EXPECT_EQ(store.readDword("SingleModeReopenDelay", SettingsScope::kUserOnly), 1000u);
     EXPECT_EQ(store.readBinary("AppFlags"), (std::vector<uint8_t>{0x01, 0xff, 0x00}));
     EXPECT_EQ(store.readString("TempFolder", SettingsScope::kUserOnly), "/a \"b\" \\c");
+    // An empty binary value deletes the value.
+    ASSERT_TRUE(store.writeBinary("AppFlags", {}));
+    EXPECT_FALSE(store.readBinary("AppFlags"));
+    EXPECT_EQ(readText(user).find("AppFlags"), std::string::npos);
 }
 
-TEST_F(SettingsTest, ReadsHandWrittenFilesWithAnyCaseCrLfBomAndContinuedHexLists) {
+TEST_F(SettingsTest, ReadsHandWrittenFilesWithAnyCaseCrLfBomContinuedHexListsAndTypeChecks) {
     writeText(user,
               "\xEF\xBB\xBFWindows Registry Editor Version 5.00\r\n\r\n"
               "; a comment\r\n"
               "[hkey_current_user\\SOFTWARE\\korvel\\VAULTORA]\r\n"
               "\"appflags\"=hex:01,02,\\\r\n"
               "  03,04\r\n"
-              "\"Delay\"=dword:A\r\n");
+              "\"Delay\"=dword:A\r\n"
+              "\"AsText\"=\"12\"\r\n"
+              "\"ShortDword\"=hex(4):01,02\r\n");
     EXPECT_EQ(store.readBinary("AppFlags"), (std::vector<uint8_t>{1, 2, 3, 4}));
     EXPECT_EQ(store.readDword("DELAY", SettingsScope::kUserOnly), 10u);
+    // A value of another type or size is absent.
+    EXPECT_FALSE(store.readDword("AsText", SettingsScope::kUserOnly));
+    EXPECT_FALSE(store.readDword("ShortDword", SettingsScope::kUserOnly));
+    EXPECT_FALSE(store.readBinary("Delay"));
     // A write replaces the value of the same name instead of adding a second one.
     ASSERT_TRUE(store.writeDword("delay", 11));
     EXPECT_EQ(store.readDword("Delay", SettingsScope::kUserOnly), 11u);
     EXPECT_EQ(readText(user).find("dword:0000000a"), std::string::npos);
 }
 
-TEST_F(SettingsTest, ValueOfAnotherTypeOrSizeIsAbsent) {
-    writeText(user,
-              "Windows Registry Editor Version 5.00\n"
-              "[HKEY_CURRENT_USER\\Software\\Korvel\\Vaultora]\n"
-              "\"AsText\"=\"12\"\n"
-              "\"ShortDword\"=hex(4):01,02\n"
-              "\"Dword\"=dword:00000005\n");
-    EXPECT_FALSE(store.readDword("AsText", SettingsScope::kUserOnly));
-    EXPECT_FALSE(store.readDword("ShortDword", SettingsScope::kUserOnly));
-    EXPECT_FALSE(store.readBinary("Dword"));
-    EXPECT_FALSE(store.readString("Dword", SettingsScope::kUserOnly));
-    EXPECT_EQ(store.readDword("Dword", SettingsScope::kUserOnly), 5u);
-}
-
-TEST_F(SettingsTest, UserValueComesFirstThenSystemValueWhenAllowed) {
+TEST_F(SettingsTest, UserValueComesFirstThenSystemValueThenDefault) {
+    EXPECT_EQ(sendMailDelayBeforeDeleteTempFile(store), 0u);
+    EXPECT_FALSE(fs::exists(user));  // reading never creates the file
     writeText(system,
               "Windows Registry Editor Version 5.00\n"
               "[HKEY_LOCAL_MACHINE\\SOFTWARE\\Korvel\\Vaultora]\n"
@@ -96,13 +94,6 @@ TEST_F(SettingsTest, UserValueComesFirstThenSystemValueWhenAllowed) {
     EXPECT_FALSE(store.deleteValue(SettingsRoot::kLocalMachine, kSettingsKey, "sendMailDelayBeforeDeleteTempFile"));
     EXPECT_EQ(readText(system), before);
     EXPECT_EQ(store.readDword(SettingsRoot::kLocalMachine, kSettingsKey, "sendMailDelayBeforeDeleteTempFile"), 500u);
-}
-
-TEST_F(SettingsTest, DefaultsWhenFilesAreMissing) {
-    EXPECT_EQ(sendMailDelayBeforeDeleteTempFile(store), 0u);
-    EXPECT_EQ(readAppFlags(store), 0xFFFFFFFFu);
-    EXPECT_FALSE(readFramePos(store));
-    EXPECT_FALSE(fs::exists(user));  // reading never creates the file
 }
 
 TEST_F(SettingsTest, UnparsableFileIsKeptAsideAndDefaultsAreUsed) {
@@ -130,14 +121,6 @@ TEST_F(SettingsTest, WritesKeepUnrelatedKeysAndUnknownTypes) {
     EXPECT_NE(text.find("[HKEY_CURRENT_USER\\Software\\Korvel\\OtherTool]\n@=\"default\"\n\"Expand\"=hex(2):41,00,00,00\n"),
               std::string::npos);
     EXPECT_EQ(store.readString(SettingsRoot::kCurrentUser, "software\\korvel\\othertool", ""), "default");
-}
-
-TEST_F(SettingsTest, EmptyBinaryDeletesTheValue) {
-    ASSERT_TRUE(store.writeBinary("Recent", {1, 2}));
-    ASSERT_TRUE(store.writeBinary("Recent", {}));
-    EXPECT_FALSE(store.readBinary("Recent"));
-    EXPECT_EQ(readText(user).find("Recent"), std::string::npos);
-    EXPECT_TRUE(store.deleteValue("Recent"));  // already gone is fine
 }
 
 TEST_F(SettingsTest, StringsThatCannotStandOnOneQuotedLineRoundTrip) {
@@ -246,7 +229,7 @@ TEST_F(SettingsTest, AppFlagsComeFromTheSystemFileAndAreChangedInTheUserFile) {
     EXPECT_EQ(readAppFlags(store), kAppFlagsAbsent);
 }
 
-TEST_F(SettingsTest, FramePosIsIgnoredWhenTooLargeOrNotBinary) {
+TEST_F(SettingsTest, FramePosIsIgnoredWhenTooLargeOrNotBinaryAndShortOnesKeepDefaults) {
     ASSERT_TRUE(store.writeBinary("FramePos", std::vector<uint8_t>(57, 1)));
     EXPECT_FALSE(readFramePos(store));
     ASSERT_TRUE(store.writeString("FramePos", "x"));
@@ -263,21 +246,18 @@ TEST_F(SettingsTest, FramePosIsIgnoredWhenTooLargeOrNotBinary) {
     std::optional<FramePos> back = readFramePos(store);
     ASSERT_TRUE(back);
     EXPECT_EQ(back->encode(), pos.encode());
-    EXPECT_EQ(back->left, -3);
     EXPECT_TRUE(back->hasRect());
-}
 
-TEST_F(SettingsTest, ShortFramePosKeepsDefaultsForMissingFields) {
     ASSERT_TRUE(store.writeBinary("FramePos", {10, 0, 0, 0, 20, 0, 0, 0}));
-    std::optional<FramePos> pos = readFramePos(store);
-    ASSERT_TRUE(pos);
-    EXPECT_EQ(pos->left, 10);
-    EXPECT_EQ(pos->top, 20);
-    EXPECT_FALSE(pos->hasRect());
-    EXPECT_EQ(pos->listViewMode, 1u);
-    EXPECT_EQ(pos->flags, FramePos::kShowTree | FramePos::kUseAutoRun);
-    EXPECT_EQ(pos->recipientMode, 1);
-    EXPECT_EQ(pos->sortColumn, -1);
+    back = readFramePos(store);  // a short record keeps the other defaults
+    ASSERT_TRUE(back);
+    EXPECT_EQ(back->left, 10);
+    EXPECT_EQ(back->top, 20);
+    EXPECT_FALSE(back->hasRect());
+    EXPECT_EQ(back->listViewMode, 1u);
+    EXPECT_EQ(back->flags, FramePos::kShowTree | FramePos::kUseAutoRun);
+    EXPECT_EQ(back->recipientMode, 1);
+    EXPECT_EQ(back->sortColumn, -1);
 }
 
 TEST_F(SettingsTest, EncryptFlagChangeKeepsTheRestOfTheRecord) {
@@ -316,15 +296,6 @@ TEST_F(SettingsTest, TempFolderIsTheChosenOrRuntimeFolderWithTrailingSlash) {
         setenv("XDG_RUNTIME_DIR", saved.c_str(), 1);
     else
         unsetenv("XDG_RUNTIME_DIR");
-}
-
-TEST_F(SettingsTest, ProcessWideStoreCanBeReplaced) {
-    Settings::setInstance(&store);
-    ASSERT_TRUE(setAppFlag(appflag::kDynamicCompact, false));
-    EXPECT_FALSE(appFlag(appflag::kDynamicCompact));
-    Settings::setInstance(nullptr);
-    EXPECT_NE(&Settings::instance(), &store);
-    EXPECT_EQ(Settings::instance().userFile(), Settings::defaultUserFile());
 }
 
 }  // namespace
