@@ -43,6 +43,7 @@
 
 #include "crypto/key_block.h"
 #include "platform/messages.h"
+#include "platform/settings.h"
 #include "platform/text.h"
 
 namespace vaultora {
@@ -71,6 +72,9 @@ const ArchiveHooks& archiveHooks() { return g_hooks; }
 Vaultora::Vaultora(std::string path, Interaction* ui)
     : m_path(std::move(path)), m_ui(ui != nullptr ? ui : &DefaultInteraction::instance()) {
     m_tempFolder = m_path + ".vrt/";
+    m_compactWhenUpdated = appFlag(appflag::kDynamicCompact);
+    m_compactFlagRead = m_compactWhenUpdated;
+    m_mailDelay = sendMailDelayBeforeDeleteTempFile();
 }
 
 Vaultora::~Vaultora() { close(); }
@@ -363,6 +367,8 @@ Result Vaultora::close() {
     m_batch = false;
     m_cache.setWriteBack(false);
     m_pendingClusterFileDeletes.clear();
+    if (m_compactWhenUpdated != m_compactFlagRead && setAppFlag(appflag::kDynamicCompact, m_compactWhenUpdated))
+        m_compactFlagRead = m_compactWhenUpdated;
     return result;
 }
 

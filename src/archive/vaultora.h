@@ -177,6 +177,7 @@ private:
     bool m_batch = false;
     bool m_modified = false;
     bool m_compactWhenUpdated = true;
+    bool m_compactFlagRead = true;  // as read from the settings, to write back only a change
     uint32_t m_mailDelay = 0;
     std::vector<uint32_t> m_pendingClusterFileDeletes;
 };
