@@ -17,6 +17,16 @@ enum class Msg : uint32_t {
     kCaptionAttention = 63,         // "Attention!"
     kCaptionError = 65,             // "Vaultora Error"
     kFileAlreadyExists = 162,       // "File '%s'\nAlready exists!"
+    // Compacting
+    kErrorCompacting = 48,          // "Error %d  in compacting archive."
+    kCaptionCompacting = 92,        // "Compacting"
+    kCrosslinkNoUnit = 93,
+    kCrosslinksDetected = 94,
+    kCrosslinkQuestion = 95,
+    kCompactingSpaceUnit = 96,
+    kCompactingLastSpaceUnit = 97,
+    kCreatingUsedSpaceList = 100,
+    kCompactingArchive = 107,
 
     // Archive object
     kExtendedKeyBlockCorrupted = 20000,
@@ -113,6 +123,51 @@ enum class Msg : uint32_t {
     kHeldWrittenAnyway,
     kHeldWriteAnyway,
     kCaptionWarning,
+    // Command-line verbs, batch log and terminal prompts
+    kVersionUndefined = 112,        // "Undefined"
+    kArchiveByPublicKey = 127,      // "Archive cannot be opened by public key."
+    kVersionCaption = 161,          // "Version"
+    kAddFileToArchive = 20600,      // "Add file '%s' to archive '%s'"
+    kNoError,
+    kErrorWritingLog,
+    kRememberChoice,                // check box of the Yes/No/Cancel prompt
+    kButtonOk,                      // button labels; '&' marks the key that answers
+    kButtonCancel,
+    kButtonAbort,
+    kButtonRetry,
+    kButtonIgnore,
+    kButtonYes,
+    kButtonNo,
+    kButtonTryAgain,
+    kButtonContinue,
+    kButtonYesAll,
+    kButtonNoAll,
+    kTerminalChoose,                // "Answer %s [%s]: "
+    kTerminalYesNo,                 // "(y/N)"
+    kTerminalArchiveName,           // "Archive name: %s"
+    kTerminalPassword,
+    kTerminalConfirmPassword,
+    kNoTerminalAnswer,
+    kNoTerminalPassword,
+    kPasswordFileUnreadable,
+    kPasswordFileWrong,
+    kPublicKeyNotAvailable,
+    // Consistency check and recovery
+    kWordFolder = 87,               // "Folder"
+    kWordFile = 91,                 // "File"
+    kCheckCrosslinkQuestion = 98,
+    kCaptionCheckArchive = 99,      // "Check Archive Content"
+    kStartBeyondTable = 101,
+    kNextBeyondTable = 102,
+    kLostChainQuestion = 103,
+    kCaptionLostChain = 104,        // "Lost cluster chain is detected."
+    kErrorStartingDialog = 105,
+    kCheckingLostClusters = 106,    // status text and caption
+    kRecoverError = 120,
+    kRecoverQuestion = 121,
+    kClustersRecovered = 122,
+    kRecoverTitle = 123,
+    kBodyMissing = 20750,           // "%s body was not found inside the archive...."
 
     kFirstFree = 21000,  // later additions number from here
 };

@@ -44,6 +44,8 @@ enum Result : uint32_t {
     kEncryptFailed = 87,
     kDecryptFailed = 88,
     kFormat1HeaderTooLong = 89,
+    kClusterCopyWriteFailed = 90,  // the crash copy of a moved record could not be written
+    kCotSaveFailed = 91,           // the table copy could not be saved during a record move
     kClusterCopyUnreadable = 92,
     kCotCopyFailed = 93,
     kCotCreateFailed = 94,
