@@ -6,6 +6,8 @@
 #include "archive/vaultora.h"
 #include "operations/compact.h"
 #include "platform/file.h"
+#include "platform/text.h"
+#include "unit_helpers.h"
 
 namespace vaultora {
 namespace {
@@ -36,28 +38,26 @@ uint64_t liveRecordBytes(const Vaultora& a) {
     return total;
 }
 
-TEST_F(Compacting, FreedChainsLeaveNoGapAndTheFileIsLiveRecordsPlusTable) {
+TEST_F(Compacting, AddsReplacesAndDeletesLeaveNoGapAndTheFileIsLiveRecordsPlusTable) {
     TempDir dir;
     const std::string path = dir / "a.vra";
     std::vector<std::vector<uint8_t>> data;
-    std::vector<uint32_t> starts;
+    auto name = [](uint32_t i) { return u"file" + std::u16string(1, static_cast<char16_t>(u'0' + i)); };
     {
         Vaultora a(path);
         ASSERT_EQ(a.create(nullptr, 0), kOk);
         for (uint32_t i = 0; i < 8; ++i) {
-            data.push_back(payloadFor(i, 1000 + i * 90000));
-            starts.push_back(writeChain(a, data.back()));
+            data.push_back(randomBytes(1000 + i * 90000, i));
+            ASSERT_EQ(test::putFile(a, name(i), data.back()), kOk);
         }
         ASSERT_EQ(a.close(), kOk);
     }
     {
         Vaultora a(path);
         ASSERT_EQ(a.open(OpenKey{}), kOk);
-        for (uint32_t i : {1u, 4u, 5u}) ASSERT_TRUE(a.freeChain(starts[i]));
-        // A replaced chain: new data appended behind, old freed.
-        data[6] = payloadFor(60, 50000);
-        a.freeChain(starts[6]);
-        starts[6] = writeChain(a, data[6]);
+        for (uint32_t i : {1u, 4u, 5u}) ASSERT_EQ(test::removeFile(a, name(i)), kOk);
+        data[6] = randomBytes(50000, 60);
+        ASSERT_EQ(test::putFile(a, name(6), data[6]), kOk);
         EXPECT_TRUE(hasSpaceToReclaim(a));
         ASSERT_EQ(a.close(), kOk);
     }
@@ -67,7 +67,13 @@ TEST_F(Compacting, FreedChainsLeaveNoGapAndTheFileIsLiveRecordsPlusTable) {
     EXPECT_FALSE(hasSpaceToReclaim(a));
     EXPECT_EQ(a.header().cotOffset, liveRecordBytes(a));
     EXPECT_EQ(static_cast<uint64_t>(fs::fileSize(path)), a.dataStart() + a.header().cotOffset + a.header().cotLength);
-    for (uint32_t i : {0u, 2u, 3u, 6u, 7u}) EXPECT_EQ(readChain(a, starts[i]), data[i]) << i;
+    for (uint32_t i : {0u, 2u, 3u, 6u, 7u}) {
+        std::vector<uint8_t> back;
+        ASSERT_EQ(test::getFile(a, name(i), back), kOk);
+        EXPECT_EQ(back, data[i]) << i;
+    }
+    std::vector<uint8_t> gone;
+    EXPECT_NE(test::getFile(a, name(1), gone), kOk);
 }
 
 TEST_F(Compacting, AlreadyCompactArchiveKeepsEveryRecordWhereItIs) {
@@ -76,8 +82,8 @@ TEST_F(Compacting, AlreadyCompactArchiveKeepsEveryRecordWhereItIs) {
     {
         Vaultora a(path);
         ASSERT_EQ(a.create(nullptr, 0), kOk);
-        writeChain(a, payloadFor(1, 700000));
-        writeChain(a, payloadFor(2, 3000));
+        ASSERT_EQ(test::putFile(a, u"big", payloadFor(1, 700000)), kOk);
+        ASSERT_EQ(test::putFile(a, u"small", payloadFor(2, 3000)), kOk);
         ASSERT_EQ(a.close(), kOk);
     }
     std::vector<CotEntry> before;
@@ -144,25 +150,30 @@ TEST_F(Compacting, RecordLargerThanTheGapStaysInItsSpaceUnit) {
     Vaultora a(path);
     ASSERT_EQ(a.create(nullptr, 0), kOk);
     uint32_t seed = 0;
-    while (kSpaceUnit - a.dataEnd() > kMaxPayload + 300000) writeChain(a, randomBytes(kMaxPayload, ++seed), false);
-    const uint64_t remaining = kSpaceUnit - a.dataEnd();
-    writeChain(a, randomBytes(remaining - 200000, ++seed), false);
+    auto nextName = [&seed] { return u"fill" + fromUtf8(std::to_string(++seed)); };
+    while (kSpaceUnit - a.dataEnd() > kMaxPayload + 300000)
+        ASSERT_EQ(test::putFile(a, nextName(), randomBytes(kMaxPayload, seed)), kOk);
+    ASSERT_EQ(test::putFile(a, nextName(), randomBytes(kSpaceUnit - a.dataEnd() - 200000, seed)), kOk);
     const uint64_t gap = kSpaceUnit - a.dataEnd();
     ASSERT_GE(gap, 190000u);
     ASSERT_LT(gap, 300000u);
     auto large = randomBytes(300000, 1000);
     auto smallData = randomBytes(50000, 1001);
-    uint32_t cl = writeChain(a, large, false);
-    uint32_t cs = writeChain(a, smallData, false);
+    ASSERT_EQ(test::putFile(a, u"large", large), kOk);
+    ASSERT_EQ(test::putFile(a, u"small", smallData), kOk);
+    SecureBytes rl, rs;
+    ASSERT_EQ(findUnitByPath(a, u"large", rl), kOk);
+    ASSERT_EQ(findUnitByPath(a, u"small", rs), kOk);
+    const uint32_t cl = unit::start(rl.data()), cs = unit::start(rs.data());
     ASSERT_EQ(a.cot()[cl].offset, kSpaceUnit);
     ASSERT_EQ(Compact(a, true), kOk);
     EXPECT_LT(a.cot()[cs].offset, kSpaceUnit);
     EXPECT_EQ(a.cot()[cl].offset, kSpaceUnit);
-    // The root directory, still in its cluster file, is appended behind the last record.
-    EXPECT_EQ(a.cot()[0].offset, kSpaceUnit + a.cot()[cl].size);
-    EXPECT_EQ(a.header().cotOffset, a.cot()[0].offset + a.cot()[0].size);
-    EXPECT_EQ(readChain(a, cl), large);
-    EXPECT_EQ(readChain(a, cs), smallData);
+    std::vector<uint8_t> back;
+    ASSERT_EQ(test::getFile(a, u"large", back), kOk);
+    EXPECT_EQ(back, large);
+    ASSERT_EQ(test::getFile(a, u"small", back), kOk);
+    EXPECT_EQ(back, smallData);
 }
 
 }  // namespace
