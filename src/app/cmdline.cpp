@@ -183,6 +183,10 @@ CommandTable::CommandTable() : m_handlers(std::size(kVerbs), verbNotAvailable) {
     m_handlers[static_cast<size_t>(Verb::kUsage)] = showUsage;
 }
 
+void CommandTable::setInvalidArgumentReporter(std::function<void(const Invocation&)> reporter) {
+    m_invalidArgument = std::move(reporter);
+}
+
 void CommandTable::setHandler(Verb verb, VerbHandler handler) {
     m_handlers[static_cast<size_t>(verb)] = std::move(handler);
 }
@@ -192,7 +196,8 @@ int CommandTable::dispatch(const Invocation& call) const {
     size_t given = call.args.size() > 2 ? call.args.size() - 2 : 0;
     if (given < verbMinArguments(call.verb)) {
         if (call.verb == Verb::kAdd || call.verb == Verb::kEncrypt) {
-            writeOut(stderr, toUtf8(msgText(Msg::kInvalidArgument)) + "\n");
+            if (m_invalidArgument) m_invalidArgument(call);
+            else writeOut(stderr, toUtf8(msgText(Msg::kInvalidArgument)) + "\n");
             return kExitTooFewArguments;
         }
         return m_handlers[static_cast<size_t>(Verb::kUsage)](Invocation{Verb::kUsage, call.args, call.batch});

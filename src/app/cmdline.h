@@ -96,12 +96,16 @@ class CommandTable {
 public:
     CommandTable();
     void setHandler(Verb verb, VerbHandler handler);
+    // Shows "Invalid argument" for "Add"/"Encrypt" with too few arguments (default: a line on
+    // standard error); the program sets the batch-aware message here.
+    void setInvalidArgumentReporter(std::function<void(const Invocation&)> reporter);
     // Runs the verb. A verb given fewer arguments than it needs runs the kUsage handler instead,
     // except "Add" and "Encrypt", which report "Invalid argument" and give 104.
     int dispatch(const Invocation& call) const;
 
 private:
     std::vector<VerbHandler> m_handlers;
+    std::function<void(const Invocation&)> m_invalidArgument;
 };
 
 // The usage text (UTF-8, "\n" line ends) and its output on standard output.

@@ -2,7 +2,11 @@
 #include <string>
 #include <vector>
 
+#include "app/batch_add.h"
+#include "app/batch_delete.h"
+#include "app/batch_extract.h"
 #include "app/cmdline.h"
+#include "app/properties.h"
 
 namespace {
 
@@ -12,11 +16,14 @@ using vaultora::Verb;
 // The place where each verb gets its handler. Until a verb is built its row keeps the
 // "not available yet" placeholder; unknown verbs always get the usage text.
 void registerVerbs(CommandTable& table) {
-    // Batch verbs (each runs its dialogs without a window and returns the exit code):
-    //   table.setHandler(Verb::kAdd, runAdd);            // also Verb::kEncrypt
-    //   table.setHandler(Verb::kExtract, runExtract);
-    //   table.setHandler(Verb::kProperties, runProperties);
-    //   table.setHandler(Verb::kDelete, runDelete);
+    // Batch verbs (each runs without a window and returns the exit code):
+    table.setHandler(Verb::kAdd, vaultora::runAdd);
+    table.setHandler(Verb::kEncrypt, vaultora::runAdd);
+    table.setInvalidArgumentReporter(vaultora::reportInvalidArgument);
+    table.setHandler(Verb::kExtract, vaultora::runExtract);
+    table.setHandler(Verb::kProperties, vaultora::runProperties);
+    table.setHandler(Verb::kDelete, vaultora::runDelete);
+    // Still to come:
     //   table.setHandler(Verb::kSend, runSend);
     //   table.setHandler(Verb::kShowPkid, runShowPkid);
     //   table.setHandler(Verb::kMakeSelfExtracted, ...); table.setHandler(Verb::kCheckSelfExtracted, ...);
@@ -27,7 +34,6 @@ void registerVerbs(CommandTable& table) {
     // first for kBareArchive, kOpen and kNew):
     //   table.setHandler(Verb::kNone, ...);  table.setHandler(Verb::kBareArchive, ...);
     //   table.setHandler(Verb::kOpen, ...);  table.setHandler(Verb::kNew, ...);
-    (void)table;
 }
 
 }  // namespace

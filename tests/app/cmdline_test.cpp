@@ -251,10 +251,10 @@ TEST(CommandLineProgram, UnknownVerbPrintsUsageAndExitsMinusOne) {
 }
 
 TEST(CommandLineProgram, PlaceholdersMissingArgumentsAndExitStatuses) {
-    RunResult r = runProgram({"extract", "a.vra", "dest", "-LF", "log.txt"});
+    RunResult r = runProgram({"send", "item", "-LF", "log.txt"});
     EXPECT_EQ(r.status, 255);
     EXPECT_TRUE(r.out.empty());
-    EXPECT_NE(r.err.find("Extract: not available yet"), std::string::npos) << r.err;
+    EXPECT_NE(r.err.find("Send: not available yet"), std::string::npos) << r.err;
 
     r = runProgram({});
     EXPECT_EQ(r.status, 255);
@@ -270,9 +270,10 @@ TEST(CommandLineProgram, PlaceholdersMissingArgumentsAndExitStatuses) {
     EXPECT_EQ(r.status, 255);
     EXPECT_EQ(r.out, usageText());
 
-    r = runProgram({"Add", "a.vra", "-LF"});  // the trailing -LF stays and counts as an item
-    EXPECT_EQ(r.status, 255);
-    EXPECT_NE(r.err.find("Add: not available yet"), std::string::npos);
+    r = runProgram({"Add", "a.vra", "-LF"}, dir.path());  // the trailing -LF stays: an item that is not there
+    EXPECT_EQ(r.status, 104);
+    EXPECT_NE(r.err.find("Invalid argument"), std::string::npos);
+    EXPECT_FALSE(fs::exists(dir / "a.vra.vrt"));
 
     r = runProgram({"add", "a.vra"});
     EXPECT_EQ(r.status, 104);
