@@ -250,6 +250,13 @@ private:
                 if (unit::kind(r) != kUnitChain) continue;
                 const uint32_t start = unit::start(r);
                 if ((start == 0 || start == kNoCluster) && unit::size(r) == 0) continue;  // owns nothing
+                if ((unit::attributes(r) & kAttrFolder) != 0 && start != 0 && !allocated(start) &&
+                    start < m_flags.size() + 65536) {
+                    // An empty folder's directory cluster holds no record, so the scan cannot find
+                    // it: the folder gets its empty directory back.
+                    if (Result rc = restoreEmptyDirectory(start); rc != kOk) return rc;
+                    continue;
+                }
                 if (start == 0 || !allocated(start)) {
                     if (Result rc = AskBodyMissing(m_archive, r, folderPath); rc != kOk) return rc;
                     changed = true;
@@ -268,6 +275,23 @@ private:
                 if (Result rc = m_archive.writeDirectoryCluster(b, true); rc != kOk) return rc;
             }
         }
+        return kOk;
+    }
+
+    Result restoreEmptyDirectory(uint32_t c) {
+        std::vector<CotEntry>& cot = m_archive.mutableCot();
+        try {
+            if (c >= cot.size()) growTable(cot, c);
+            if (c >= m_flags.size()) {
+                m_flags.resize(c + 1, 0);
+                m_visited.resize(c + 1, 0);
+            }
+        } catch (const std::bad_alloc&) {
+            return kNoMemory;
+        }
+        cot[c] = CotEntry{kEndOfChain, 0, 0};
+        m_flags[c] |= kFlagDirectory | kFlagNamed;
+        m_visited[c] = 1;
         return kOk;
     }
 
