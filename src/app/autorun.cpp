@@ -170,7 +170,9 @@ Result readAutoRun(AutoRunSettings& settings, Vaultora& archive) {
 Result writeAutoRun(const AutoRunSettings& settings, Vaultora& archive) {
     const std::vector<uint8_t> bytes = encodeAutoRun(settings);
     Adder adder(archive);
-    Result rc = adder.AddMemoryFile(0, kAutoRunName, bytes.data(), bytes.size(), kAutoRunAttributes, nullptr);
+    ToAllFlags replace;  // an existing AutoRun.inf is replaced without a question
+    replace.overwriteAll = true;
+    Result rc = adder.AddMemoryFile(0, kAutoRunName, bytes.data(), bytes.size(), kAutoRunAttributes, &replace);
     if (rc == kOk) rc = adder.flush();
     return rc;
 }

@@ -7,6 +7,7 @@
 #include "app/batch_extract.h"
 #include "app/cmdline.h"
 #include "app/properties.h"
+#include "operations/compact.h"
 
 namespace {
 
@@ -39,6 +40,9 @@ void registerVerbs(CommandTable& table) {
 }  // namespace
 
 int main(int argc, char** argv) {
+    // Closing an archive commits through the full compaction (with its check) and a lost table
+    // is offered for recovery.
+    vaultora::installOperationHooks();
     std::vector<std::string> args(argv, argv + argc);  // element 0 is the program path
     CommandTable table;
     registerVerbs(table);
