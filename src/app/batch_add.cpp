@@ -128,7 +128,10 @@ int batchAdd(const std::vector<std::string>& args, bool encrypt, VerbSession& se
     for (const std::string& item : items.paths) {
         if (BatchLog* log = session.log())
             (void)log->line(msgFormat(Msg::kAddFileToArchive, {item, archivePath}));
-        rc = addItem(archive, session, item, collect);
+        // "folder/" names the folder itself, as "folder" does.
+        std::string source = item;
+        while (source.size() > 1 && source.back() == '/') source.pop_back();
+        rc = addItem(archive, session, source, collect);
         if (rc != kOk) break;
     }
     if (rc != kOk && rc != kCancelled)

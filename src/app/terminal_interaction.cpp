@@ -43,7 +43,7 @@ public:
         }
     }
     ~EchoOff() {
-        if (m_active) tcsetattr(m_fd, TCSAFLUSH, &m_saved);
+        if (m_active) tcsetattr(m_fd, TCSANOW, &m_saved);
     }
 
 private:
@@ -114,7 +114,6 @@ std::optional<std::string> TerminalInteraction::readLine() {
 }
 
 bool TerminalInteraction::readSecret(SecureString& out) {
-    EchoOff quiet(m_in);
     out.clear();
     bool any = false;
     for (;;) {
@@ -239,6 +238,9 @@ int TerminalInteraction::askFiveWay(std::u16string_view text, std::u16string_vie
 }
 
 bool TerminalInteraction::readPassword(std::u16string_view label, PasswordRecord& out) {
+    // Echo goes off before the prompt shows, so nothing typed after it is ever echoed (stale
+    // type-ahead from before the prompt is dropped).
+    EchoOff quiet(m_in);
     write(m_out, label);
     SecureString typed;
     if (!readSecret(typed)) {

@@ -59,9 +59,9 @@ private:
     int choose(std::u16string_view text, std::u16string_view caption, const std::vector<Choice>& choices,
                int defaultChoice, int onEnd);
     void write(int fd, std::u16string_view text);
-    // Reads one line (without its end); nullopt at end of input. With `secret`, echo is off and
-    // the line is kept in wiping memory.
+    // Reads one line (without its end); nullopt at end of input.
     std::optional<std::string> readLine();
+    // The same into wiping memory; false at end of input.
     bool readSecret(SecureString& out);
     bool readPassword(std::u16string_view label, PasswordRecord& out);
     int noTerminal(std::u16string_view text, int answer);

@@ -105,6 +105,8 @@ TEST(BatchVerbs, ExtractPatternsAndTheExitCodeOfTheLastPattern) {
     home.usePassword(kPassword);
     ASSERT_EQ(home.run({"Add", "p.vra", "tree/a.txt", "tree/b.log", "tree/docs"}).status, 0);
 
+    writeText(home / "tree/docs/deep/e.txt", "echo\n");
+    ASSERT_EQ(home.run({"Add", "p.vra", "tree/docs/"}).status, 0);  // a trailing slash names the folder
     ProgramResult r = home.run({"Extract", "p.vra", "out1", "*.txt"});
     EXPECT_EQ(r.status, 0) << r.err;
     EXPECT_EQ(readText(home / "out1/a.txt"), "alpha\n");
@@ -115,6 +117,7 @@ TEST(BatchVerbs, ExtractPatternsAndTheExitCodeOfTheLastPattern) {
     EXPECT_EQ(r.status, 0) << r.err;
     EXPECT_EQ(readText(home / "out2/b.log"), "bravo\n");
     EXPECT_EQ(readText(home / "out2/docs/deep/d.md"), "delta\n");
+    EXPECT_EQ(readText(home / "out2/docs/deep/e.txt"), "echo\n");
     EXPECT_FALSE(fs::exists(home / "out2/docs/c.txt"));
 
     // A folder that is not in the archive fails the last pattern; an earlier one still ran.
