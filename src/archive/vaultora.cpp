@@ -367,6 +367,8 @@ Result Vaultora::close() {
     m_batch = false;
     m_cache.setWriteBack(false);
     m_pendingClusterFileDeletes.clear();
+    m_pendingFrees.clear();
+    m_savedCotCopy.clear();
     if (m_compactWhenUpdated != m_compactFlagRead && setAppFlag(appflag::kDynamicCompact, m_compactWhenUpdated))
         m_compactFlagRead = m_compactWhenUpdated;
     return result;
@@ -584,13 +586,28 @@ Result Vaultora::writeDirectoryCluster(ChainBuffer& buffer, bool throughCache) {
         return kOk;
     }
     if (throughCache) {
-        auto writer = [this](uint32_t cl, const SecureBytes& data) { return writeClusterFile(cl, data); };
+        // An evicted directory cluster goes to its file behind a table that names every cluster
+        // it may refer to.
+        auto writer = [this](uint32_t cl, const SecureBytes& data) {
+            Result rc = saveTableNow();
+            return rc != kOk ? rc : writeClusterFile(cl, data);
+        };
         if (Result rc = m_cache.store(buffer, writer); rc != kOk) return rc;
         if (m_batch) return kOk;
     }
+    if (Result rc = saveTableNow(); rc != kOk) return rc;
     if (Result rc = writeClusterFile(c, buffer.data); rc != kOk) return rc;
     buffer.dirty = false;
+    applyPendingFrees();
     return saveClusterTable();
+}
+
+Result Vaultora::saveTableNow() {
+    const bool batch = m_batch;
+    m_batch = false;
+    Result rc = saveClusterTable();
+    m_batch = batch;
+    return rc;
 }
 
 Result Vaultora::moveClusterFile(uint32_t c) {
@@ -626,14 +643,15 @@ uint32_t Vaultora::allocateCluster(uint32_t hint) {
     uint32_t c = hint + 1;
     if (hint == kNoCluster || c == 0) c = 1;
     if (c >= m_cot.size()) growTable(m_cot, c);
-    if (c >= m_cot.size() || m_cot[c].used()) {
+    auto taken = [this](uint32_t i) { return m_cot[i].used() || m_pendingFrees.count(i) != 0; };
+    if (c >= m_cot.size() || taken(c)) {
         c = 0;
         for (uint32_t i = 1;; ++i) {
             if (i >= m_cot.size()) {
                 if (m_cot.size() >= 0xFFFFFFFEull) return kNoCluster;
                 growTable(m_cot, i);
             }
-            if (!m_cot[i].used()) { c = i; break; }
+            if (!taken(i)) { c = i; break; }
         }
     }
     m_cot[c] = CotEntry{kEndOfChain, 0, 0};
@@ -657,16 +675,32 @@ bool Vaultora::freeChain(uint32_t start) {
     size_t steps = 0;
     while (c != kEndOfChain) {
         if (c >= m_cot.size() || c == 0 || steps++ > m_cot.size()) return false;
-        uint32_t next = m_cot[c].next;
+        const uint32_t next = m_cot[c].next;
         if (next == 0) return false;
-        // The cluster file stays until the table that no longer names it has been saved.
-        if (m_cot[c].inClusterFile()) m_pendingClusterFileDeletes.push_back(c);
+        // Until the directories that named the chain have been written, the saved table keeps
+        // the cluster in use and allocation passes it over (applyPendingFrees).
+        m_pendingFrees.emplace(c, m_cot[c]);
         m_cache.drop(c);
         m_cot[c].next = 0;
         m_cot[c].offset = 0;
         c = next;
     }
     return true;
+}
+
+void Vaultora::applyPendingFrees() {
+    for (const auto& [c, entry] : m_pendingFrees) {
+        // The cluster file stays until the table that no longer names it has been saved.
+        if (entry.inClusterFile() && !(c < m_cot.size() && m_cot[c].used())) m_pendingClusterFileDeletes.push_back(c);
+    }
+    m_pendingFrees.clear();
+}
+
+std::vector<CotEntry> Vaultora::tableToSave() const {
+    std::vector<CotEntry> table = m_cot;
+    for (const auto& [c, entry] : m_pendingFrees)
+        if (c < table.size() && !table[c].used()) table[c] = entry;
+    return table;
 }
 
 void Vaultora::deletePendingClusterFiles() {
@@ -707,18 +741,24 @@ Result Vaultora::writeCotCopy(const std::vector<uint8_t>& record) {
     if (!ensureTemporaryFolder()) return kTempFolder;
     const std::string cot = crashPath(kCotFile);
     if (fs::exists(cot) && !fs::copyFile(cot, crashPath(kCotCopyFile))) return kCotCopyFailed;
+    m_savedCotCopy.clear();
     File f;
     if (f.open(cot, OpenMode::kCreateAlways) != 0) return kCotCreateFailed;
     if (!f.writeAt(0, record.data(), record.size())) return kCotWriteFailed;
     if (!f.sync()) return kCotFlushFailed;
+    m_savedCotCopy = record;
     return kOk;
 }
 
 Result Vaultora::saveClusterTable() {
     if (m_batch) return kOk;
     std::vector<uint8_t> record;
-    if (Result rc = encodeCotRecord(m_cot, blockSize(), m_cipher, record); rc != kOk)
+    if (Result rc = encodeCotRecord(tableToSave(), blockSize(), m_cipher, record); rc != kOk)
         return rc == kNoMemory ? kNoMemory : rc;
+    if (record == m_savedCotCopy && fs::exists(crashPath(kCotFile))) {
+        deletePendingClusterFiles();
+        return kOk;  // ~COT.dat already holds exactly this table
+    }
     if (Result rc = writeCotCopy(record); rc != kOk) return rc;
     deletePendingClusterFiles();
     if (m_header.cotOffset != kCotNotStored && m_header.cotLength != record.size()) {
@@ -912,18 +952,25 @@ bool Vaultora::setBatch(bool on) {
         m_cache.setWriteBack(true);
     } else {
         m_batch = false;
-        // The table goes first, so the directories written next never name clusters it calls free.
-        if (m_modified) (void)saveClusterTable();
-        (void)flushDirectoryCache();
+        // A failure leaves the changed directories in the cache; the commit tries them again.
+        if (m_modified) (void)flushDirectoryCache();
         m_cache.setWriteBack(false);
-        if (m_modified) (void)saveClusterTable();
     }
     return previous;
 }
 
 Result Vaultora::flushDirectoryCache() {
-    auto writer = [this](uint32_t c, const SecureBytes& data) { return writeClusterFile(c, data); };
-    return m_cache.flush(writer);
+    if (!m_modified) return kOk;
+    // The table goes first, so the directories written next never name clusters it calls free;
+    // the clusters they no longer name are freed once they are written.
+    Result rc = saveTableNow();
+    if (rc == kOk) {
+        auto writer = [this](uint32_t c, const SecureBytes& data) { return writeClusterFile(c, data); };
+        rc = m_cache.flush(writer);
+    }
+    if (rc != kOk) return rc;
+    applyPendingFrees();
+    return saveTableNow();
 }
 
 Result Vaultora::commitTail() {

@@ -2,6 +2,7 @@
 // The archive object: one open archive file with its header, cluster table, record cipher,
 // directory cache and temporary folder of crash copies.
 #include <array>
+#include <map>
 #include <cstdint>
 #include <string>
 #include <vector>
@@ -68,7 +69,11 @@ public:
     // Cluster table.
     uint32_t allocateCluster(uint32_t hint);
     [[nodiscard]] Result appendCluster(uint32_t chainStart, uint32_t& added);
+    // Frees a chain. Until the directories that named it have been written (the next directory
+    // write or flush calls applyPendingFrees), the saved table keeps its clusters in use and
+    // allocation passes them over.
     bool freeChain(uint32_t start);
+    void applyPendingFrees();
     uint32_t nextCluster(uint32_t c) const;
     uint32_t previousCluster(uint32_t c) const;
     std::vector<uint32_t> chainClusters(uint32_t start) const;
@@ -150,6 +155,8 @@ private:
     Result writeClusterFile(uint32_t c, const SecureBytes& payload);
     Result encodeCluster(uint32_t c, const uint8_t* payload, uint32_t n, std::vector<uint8_t>& record);
     Result writeCotCopy(const std::vector<uint8_t>& record);
+    Result saveTableNow();  // saves the table even in batch mode
+    std::vector<CotEntry> tableToSave() const;
     Result loadCotFrom(const std::string& path);
     Result computeHeaderCheck(cSymAlg* cipher, std::array<uint8_t, 20>& out) const;
     void repairInterruptedClusterFiles();
@@ -180,6 +187,8 @@ private:
     bool m_compactFlagRead = true;  // as read from the settings, to write back only a change
     uint32_t m_mailDelay = 0;
     std::vector<uint32_t> m_pendingClusterFileDeletes;
+    std::map<uint32_t, CotEntry> m_pendingFrees;  // freed clusters with their entries as last saved
+    std::vector<uint8_t> m_savedCotCopy;  // what ~COT.dat holds, to skip saving the same table
 };
 
 }  // namespace vaultora

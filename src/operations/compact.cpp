@@ -140,6 +140,8 @@ Result Compact(Vaultora& a, bool force) {
     if (a.isBatch()) a.setBatch(false);
     if (Result rc = a.flushDirectoryCache(); rc != kOk) return rc;
     if (Result rc = CheckArchive(a); rc != kOk) return rc;
+    // What the check changed goes out now, so the chains it freed are free for the moves.
+    if (Result rc = a.flushDirectoryCache(); rc != kOk) return rc;
 
     std::vector<StoredRecord> records;
     if (Result rc = buildUsedSpaceList(a, records); rc != kOk) return rc;
