@@ -473,19 +473,32 @@ TEST(ArchiveLocking, WriterExcludesOthersAndReaderAllowsReadersOnly) {
     }
 }
 
+// An archive the user may not write fails the read-write open with 71 and opens read-only. Root
+// may write any file, so as root the check runs in a child that has given up root.
 TEST(ArchiveLocking, UnwritableArchiveOpensReadOnly) {
-    if (geteuid() == 0) GTEST_SKIP() << "root may write any file";
     TempDir dir;
     const std::string path = dir / "a.vra";
     {
         Vaultora a(path);
         ASSERT_EQ(a.create(nullptr, 0), kOk);
+        writeChain(a, payloadFor(1, 100));
     }
-    chmod(path.c_str(), 0400);
-    Vaultora a(path);
-    EXPECT_EQ(a.openFile(false), kCannotOpen);
-    EXPECT_EQ(a.open(OpenKey{}), kOk);
-    EXPECT_TRUE(a.isReadOnly());
+    ASSERT_EQ(chmod(path.c_str(), 0444), 0);
+    ASSERT_EQ(chmod(dir.path().c_str(), 0755), 0);
+    pid_t pid = fork();
+    ASSERT_GE(pid, 0);
+    if (pid == 0) {
+        if (geteuid() == 0 && (setgid(65534) != 0 || setuid(65534) != 0)) _exit(10);
+        Vaultora a(path);
+        if (a.openFile(false) != kCannotOpen) _exit(11);
+        if (a.open(OpenKey{}) != kOk) _exit(12);
+        if (!a.isReadOnly()) _exit(13);
+        _exit(0);
+    }
+    int status = 0;
+    waitpid(pid, &status, 0);
+    ASSERT_TRUE(WIFEXITED(status));
+    EXPECT_EQ(WEXITSTATUS(status), 0) << "10 no unprivileged user, 11 read-write open, 12 open, 13 not read-only";
 }
 
 }  // namespace
