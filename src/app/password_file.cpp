@@ -1,8 +1,5 @@
 #include "app/password_file.h"
 
-#include <fcntl.h>
-#include <unistd.h>
-
 #include <cerrno>
 #include <cstdlib>
 

@@ -3,7 +3,6 @@
 
 #include <sys/stat.h>
 
-#include <regex>
 
 #include "app/autorun.h"
 #include "app/batch_delete.h"
@@ -170,22 +169,19 @@ TEST(BatchVerbs, BatchLogRecordsEachItemAndAnswersQuestionsWithTheirDefaults) {
     home.usePassword(kPassword);
     ProgramResult r = home.run({"Add", "g.vra", "tree/a.txt", "-LF", "add.log"});
     ASSERT_EQ(r.status, 0) << r.err;
-    std::string log = readLog(home / "add.log");
-    const std::string ts = R"(\d{4}/\d{1,2}/\d{1,2}  \d\d:\d\d:\d\d:\d\d\d)";
-    EXPECT_TRUE(std::regex_match(log, std::regex(ts + " Add file 'tree/a.txt' to archive 'g.vra'\r\n" + ts +
-                                                 " No error!\r\n")))
-        << log;
+    std::string log = test::maskLogTimestamps(readLog(home / "add.log"));
+    EXPECT_EQ(log, "TS Add file 'tree/a.txt' to archive 'g.vra'\r\nTS No error!\r\n");
 
     // A changed file asks before it replaces; nobody answers, so the default (Yes) is taken and
     // logged, and the log is appended to (one byte-order mark).
     writeText(home / "tree/a.txt", "alpha two\n");
     r = home.run({"Add", "g.vra", "tree/a.txt", "-LV", "add.log"});
     ASSERT_EQ(r.status, 0) << r.err;
-    log = readLog(home / "add.log");
+    log = test::maskLogTimestamps(readLog(home / "add.log"));
     EXPECT_EQ(log.find("\xEF\xBB\xBF"), std::string::npos);
-    EXPECT_TRUE(std::regex_search(log, std::regex(ts + " Attention! The archive already contains file\n[^\r]*a.txt\n\n"
-                                                       "Overwrite existing file\\?\r\n\r\nMessage Result = YES\r\n")))
-        << log;
+    const size_t question = log.find("\r\nTS Attention! The archive already contains file\n\\a.txt\n\n"
+                                     "Overwrite existing file?\r\n\r\nMessage Result = YES\r\n");
+    EXPECT_NE(question, std::string::npos) << log;
     EXPECT_NE(log.find("tree/a.txt, added\r\n"), std::string::npos) << log;  // verbose: progress lines
     r = home.run({"Extract", "g.vra", "out"});
     ASSERT_EQ(r.status, 0);
@@ -194,8 +190,8 @@ TEST(BatchVerbs, BatchLogRecordsEachItemAndAnswersQuestionsWithTheirDefaults) {
     // Too few arguments in batch mode: logged with its answer, not only printed.
     r = home.run({"Add", "g.vra", "-LF", "few.log"});
     EXPECT_EQ(r.status, 104);
-    EXPECT_TRUE(std::regex_match(readLog(home / "few.log"),
-                                 std::regex(ts + " Vaultora Invalid argument\r\n\r\nMessage Result = OK\r\n")));
+    EXPECT_EQ(test::maskLogTimestamps(readLog(home / "few.log")),
+              "TS Vaultora Invalid argument\r\n\r\nMessage Result = OK\r\n");
 }
 
 TEST(BatchVerbs, ExitCodesOfTheErrorRows) {

@@ -108,4 +108,40 @@ inline std::u16string fromUtf16le(const std::vector<uint8_t>& bytes, size_t from
     return s;
 }
 
+// The log text with the timestamp at the start of each line replaced by "TS"; a line start that
+// is not a well-formed timestamp ("2026/12/6  09:05:03:042": month 1-12 and day 1-31 without
+// leading zeros, 24-hour time, milliseconds) is left as it is, so a comparison shows it.
+inline std::string maskLogTimestamps(const std::string& text) {
+    auto number = [&](size_t& at, size_t minDigits, size_t maxDigits, int low, int high) {
+        size_t n = 0;
+        int value = 0;
+        while (at + n < text.size() && n < maxDigits && text[at + n] >= '0' && text[at + n] <= '9')
+            value = value * 10 + (text[at + n++] - '0');
+        if (n < minDigits || value < low || value > high || (n > 1 && maxDigits == 2 && minDigits == 1 && text[at] == '0'))
+            return false;
+        at += n;
+        return true;
+    };
+    auto literal = [&](size_t& at, const char* s) {
+        const std::string lit(s);
+        if (text.compare(at, lit.size(), lit) != 0) return false;
+        at += lit.size();
+        return true;
+    };
+    std::string out;
+    size_t line = 0;
+    while (line < text.size()) {
+        size_t at = line;
+        const bool stamp = number(at, 4, 4, 1970, 9999) && literal(at, "/") && number(at, 1, 2, 1, 12) &&
+                           literal(at, "/") && number(at, 1, 2, 1, 31) && literal(at, "  ") && number(at, 2, 2, 0, 23) &&
+                           literal(at, ":") && number(at, 2, 2, 0, 59) && literal(at, ":") && number(at, 2, 2, 0, 59) &&
+                           literal(at, ":") && number(at, 3, 3, 0, 999);
+        size_t end = text.find("\r\n", line);
+        end = end == std::string::npos ? text.size() : end + 2;
+        out += stamp ? "TS" + text.substr(at, end - at) : text.substr(line, end - line);
+        line = end;
+    }
+    return out;
+}
+
 }  // namespace vaultora::test
