@@ -49,20 +49,6 @@ TEST(BatchLog, QuestionsGetTheirStyleDefaultAndBothAreLogged) {
     EXPECT_EQ(maskLogTimestamps(text), expected);
 }
 
-TEST(BatchLog, AnswerNamesAndDefaultAnswers) {
-    EXPECT_EQ(answerName(1), u"OK");
-    EXPECT_EQ(answerName(10), u"TRYAGAIN");
-    EXPECT_EQ(answerName(11), u"CONTINUE");
-    EXPECT_EQ(answerName(32000), u"TIMEOUT");
-    EXPECT_EQ(answerName(32001), u"Undefined");
-    EXPECT_EQ(answerName(1000), u"Undefined");
-    EXPECT_EQ(defaultAnswer(mb::kOk | mb::kDefButton3), kAnswerOk);
-    EXPECT_EQ(defaultAnswer(mb::kOkCancel | mb::kDefButton3), 0);
-    EXPECT_EQ(defaultAnswer(mb::kCancelTryContinue | mb::kDefButton2), kAnswerTryAgain);
-    EXPECT_EQ(defaultAnswer(mb::kRetryCancel | mb::kDefButton2), kAnswerCancel);
-    EXPECT_EQ(defaultAnswer(7), 0);
-}
-
 TEST(BatchLog, AppendsToAnExistingLogAndKeepsLinesWithinTheLimit) {
     TempDir dir;
     const std::string path = dir / "log.txt";
