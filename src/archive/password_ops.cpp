@@ -30,6 +30,18 @@ Result readExtended(Vaultora& a, SecureBytes& ext, bool& cleared) {
     return kOk;
 }
 
+// Reads both key blocks of an encrypted archive; an unencrypted one is only told so.
+Result readBlocksOfEncrypted(Vaultora& a, SecureBytes& master, SecureBytes& ext, bool& encrypted) {
+    encrypted = a.cipherId() != 0;
+    if (!encrypted) {
+        a.ui().message(msgText(Msg::kArchiveNotEncrypted), msgText(Msg::kCaptionVaultora), mb::kOk | mb::kIconWarning);
+        return kOk;
+    }
+    bool cleared = false;
+    if (Result rc = a.readMasterKeyBlock(master); rc != kOk) return rc;
+    return readExtended(a, ext, cleared);
+}
+
 // Asks for a new password until one is given that the archive does not know yet.
 Result askNewPassword(Vaultora& a, const SecureBytes& master, const SecureBytes& ext, PasswordRecord& pw) {
     const std::array<uint8_t, 68> image = a.header().encode();
@@ -57,14 +69,9 @@ Result createWithPassword(Vaultora& a, const KeyBlockParams& params, const Passw
 }
 
 Result addPassword(Vaultora& a, const KeyBlockParams& params) {
-    if (a.cipherId() == 0) {
-        a.ui().message(msgText(Msg::kArchiveNotEncrypted), msgText(Msg::kCaptionVaultora), mb::kOk | mb::kIconWarning);
-        return kOk;
-    }
     SecureBytes master, ext;
-    bool cleared = false;
-    if (Result rc = a.readMasterKeyBlock(master); rc != kOk) return rc;
-    if (Result rc = readExtended(a, ext, cleared); rc != kOk) return rc;
+    bool encrypted = false;
+    if (Result rc = readBlocksOfEncrypted(a, master, ext, encrypted); rc != kOk || !encrypted) return rc;
     PasswordRecord pw;
     if (Result rc = askNewPassword(a, master, ext, pw); rc != kOk) return rc;
     ArchiveKey key;
@@ -80,14 +87,9 @@ Result addPassword(Vaultora& a, const KeyBlockParams& params) {
 }
 
 Result changePassword(Vaultora& a, const KeyBlockParams& params) {
-    if (a.cipherId() == 0) {
-        a.ui().message(msgText(Msg::kArchiveNotEncrypted), msgText(Msg::kCaptionVaultora), mb::kOk | mb::kIconWarning);
-        return kOk;
-    }
     SecureBytes master, ext;
-    bool cleared = false;
-    if (Result rc = a.readMasterKeyBlock(master); rc != kOk) return rc;
-    if (Result rc = readExtended(a, ext, cleared); rc != kOk) return rc;
+    bool encrypted = false;
+    if (Result rc = readBlocksOfEncrypted(a, master, ext, encrypted); rc != kOk || !encrypted) return rc;
     const std::array<uint8_t, 68> image = a.header().encode();
     PasswordPacketLocation where;
     for (;;) {
