@@ -106,7 +106,7 @@ std::u16string formatText(std::u16string_view fmt, std::initializer_list<FormatA
         char16_t conv = fmt[j];
         std::u16string piece;
         if (it == args.end()) {
-            piece = std::u16string(fmt.substr(i, j - i + 1));  // missing argument: keep the spec as it is
+            piece = std::u16string(fmt.substr(i, j - i + 1));  // missing argument: keep the conversion as written
         } else {
             const FormatArg& a = *it++;
             if (conv == u's' || conv == u'S') {
