@@ -16,11 +16,29 @@
 #include <vector>
 
 #include "archive/extract.h"
+#include "archive/password_ops.h"
 #include "archive/walk.h"
 #include "operations/add.h"
 #include "platform/file.h"
 
 using namespace vaultora;
+
+namespace {
+
+// Both sides encrypt with AES-256, so the comparison is like for like.
+const PasswordRecord& benchPassword() {
+    static const PasswordRecord p = PasswordRecord::fromUtf8("benchmark passphrase");
+    return p;
+}
+
+KeyBlockParams benchParams() {
+    KeyBlockParams p = DefaultKeyBlockParams();
+    p.archiveAlg = 9;
+    p.keyAlg = 9;
+    return p;
+}
+
+}  // namespace
 
 namespace {
 
@@ -109,7 +127,7 @@ int main(int argc, char** argv) {
         const auto t0 = std::chrono::steady_clock::now();
         {
             Vaultora a(bigArchive);
-            if (a.create(nullptr, 0) != kOk) return 1;
+            if (createWithPassword(a, benchParams(), benchPassword()) != kOk) return 1;
             Adder adder(a);
             ToAllFlags flags;
             if (adder.AddTree(u"", bigFile, flags, kModePlain) != kOk) return 1;
@@ -141,7 +159,7 @@ int main(int argc, char** argv) {
     auto t0 = std::chrono::steady_clock::now();
     {
         Vaultora a(archive);
-        if (a.create(nullptr, 0) != kOk) return 1;
+        if (createWithPassword(a, benchParams(), benchPassword()) != kOk) return 1;
         Adder adder(a);
         ToAllFlags flags;
         if (Result rc = adder.AddTree(u"", corpus, flags, kModePlain); rc != kOk) {
@@ -156,7 +174,9 @@ int main(int argc, char** argv) {
     t0 = std::chrono::steady_clock::now();
     {
         Vaultora a(archive);
-        if (a.open(OpenKey{}) != kOk) return 1;
+        OpenKey key;
+        key.password = &benchPassword();
+        if (a.open(key) != kOk) return 1;
         cExtractFileActorBlock actor(a, out);
         if (Result rc = walk(a, u"*", 0, u"", actor, nullptr); rc != kOk) {
             std::fprintf(stderr, "extract failed: %u\n", rc);
@@ -191,7 +211,7 @@ int main(int argc, char** argv) {
     std::printf("%-34s %10.1f %10.1f %10.2f\n", "extract (MB/s)", mb / extractSeconds, mb / refExtractSeconds,
                 refExtractSeconds / extractSeconds);
     std::printf("%-34s %10.1f %10.1f\n", "output size (MB)", archiveSize / 1e6, refSize / 1e6);
-    std::printf("(the archive is not encrypted yet: the record cipher is not wired into this build)\n");
+    std::printf("(both sides encrypt with AES-256: our archive with cipher id 9, the reference with gpg)\n");
 
     fs::removeTree(work);
     return 0;
