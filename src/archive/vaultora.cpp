@@ -369,6 +369,11 @@ Result Vaultora::close() {
     m_pendingClusterFileDeletes.clear();
     m_pendingFrees.clear();
     m_savedCotCopy.clear();
+    // The archive key and its cipher schedule are wiped as they are released.
+    m_archiveKey.clear();
+    m_archiveKey.shrink_to_fit();
+    m_cipher = ClusterCipher();
+    m_cipherId = 0;
     if (m_compactWhenUpdated != m_compactFlagRead && setAppFlag(appflag::kDynamicCompact, m_compactWhenUpdated))
         m_compactFlagRead = m_compactWhenUpdated;
     return result;
@@ -378,7 +383,12 @@ Result Vaultora::close() {
 // Creation
 
 Result Vaultora::create(const uint8_t* masterBlock, size_t masterLength) {
+    // The cipher set up for the new archive survives the reset of close().
+    const uint8_t cipherId = m_cipherId;
+    SecureBytes key = std::move(m_archiveKey);
+    ClusterCipher cipher = std::move(m_cipher);
     close();
+    setRecordCipher(cipherId, std::move(key), std::move(cipher));
     m_header = Header{};
     uint32_t b = m_cipher.hasCipher() ? m_cipher.blockSize() : 8;
     m_header.blockSize = static_cast<uint8_t>(std::max<uint32_t>(b, 8));

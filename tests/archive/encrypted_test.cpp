@@ -56,6 +56,8 @@ TEST_P(EveryCipher, ArchiveRoundTripsAndOnlyItsPasswordOpensIt) {
     EXPECT_EQ(a.cipherId(), id);
     EXPECT_EQ(readChain(a, s), data);
     a.close();
+    EXPECT_TRUE(a.archiveKey().empty()) << "the key is released at close";
+    EXPECT_FALSE(a.recordCipher().hasCipher());
 
     if (id != 0) {
         const PasswordRecord wrong = PasswordRecord::fromUtf8("correct horsf");
