@@ -1,6 +1,8 @@
 #include "platform/messages.h"
 
+#include <algorithm>
 #include <map>
+#include <vector>
 #include <mutex>
 
 namespace vaultora {
@@ -274,6 +276,16 @@ std::u16string_view msgText(Msg id) {
     for (const Entry& e : kTable)
         if (e.id == id) return e.text;
     return u"";
+}
+
+std::vector<uint32_t> duplicateMessageIds() {
+    std::vector<uint32_t> ids;
+    for (const Entry& e : kTable) ids.push_back(static_cast<uint32_t>(e.id));
+    std::sort(ids.begin(), ids.end());
+    std::vector<uint32_t> dups;
+    for (size_t i = 1; i < ids.size(); ++i)
+        if (ids[i] == ids[i - 1] && (dups.empty() || dups.back() != ids[i])) dups.push_back(ids[i]);
+    return dups;
 }
 
 std::u16string msgFormat(Msg id, std::initializer_list<FormatArg> args) {

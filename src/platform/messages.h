@@ -7,6 +7,7 @@
 #include <initializer_list>
 #include <string>
 #include <string_view>
+#include <vector>
 
 #include "platform/text.h"
 
@@ -176,6 +177,10 @@ enum class Msg : uint32_t {
 std::u16string_view msgText(Msg id);
 // The text formatted printf-style with the arguments.
 std::u16string msgFormat(Msg id, std::initializer_list<FormatArg> args);
+
+// Numbers that more than one entry of the table uses (two texts under one number would make the
+// later one unreachable); empty when the table is sound.
+std::vector<uint32_t> duplicateMessageIds();
 
 // A translation hook: when set, it is asked first and may return a replacement text.
 using MessageTranslator = std::function<bool(Msg id, std::u16string& out)>;
