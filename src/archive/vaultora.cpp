@@ -53,6 +53,7 @@ namespace {
 ArchiveHooks g_hooks;
 
 constexpr const char* kCotFile = "~COT.dat";
+constexpr uint64_t kMaxExtendedKeyBlock = 16u << 20;
 constexpr const char* kCotCopyFile = "~COTCopy.dat";
 constexpr const char* kSignatureFile = "~Signature.dat";
 constexpr const char* kClusterCopyFile = "~Cluster.dat";
@@ -861,11 +862,15 @@ bool Vaultora::readExtendedKeyBlock(SecureBytes& block) {
         const uint64_t pos = dataStart() + m_header.cotOffset + m_header.cotLength;
         const int64_t fileSize = m_file.size();
         if (fileSize < 0 || pos > static_cast<uint64_t>(fileSize)) return false;
+        // Thousands of key packets fit in far less; more is a damaged header pointing elsewhere.
+        if (static_cast<uint64_t>(fileSize) - pos > kMaxExtendedKeyBlock) return false;
         bytes.resize(static_cast<size_t>(static_cast<uint64_t>(fileSize) - pos));
         if (!m_file.readExact(pos, bytes.data(), bytes.size())) return false;
     }
     block.assign(bytes.begin(), bytes.end());
-    return true;
+    secureWipe(bytes.data(), bytes.size());
+    // A block whose packets do not frame within it is damaged.
+    return block.empty() || CheckExtendedKeyBlock(block.data(), block.size()) == kOk;
 }
 
 void Vaultora::backupExtendedKeyBlock() {

@@ -215,6 +215,35 @@ TEST(PasswordOperations, ChangingTheMasterPasswordKeepsTheDataAndDropsTheOldPass
     EXPECT_EQ(readChain(a, s), data);
 }
 
+TEST(PasswordOperations, DamagedExtendedBlockIsReportedAndTheMasterPasswordStillOpens) {
+    TempDir dir;
+    const std::string path = dir / "a.vra";
+    auto data = payloadFor(9, 2000);
+    uint32_t s = makeArchive(path, paramsFor(9), data);
+    {
+        ScriptedInteraction ui;
+        ui.expectPassword("second password");
+        Vaultora a(path, &ui);
+        OpenKey k;
+        k.password = &kPassword;
+        ASSERT_EQ(a.open(k), kOk);
+        ASSERT_EQ(addPassword(a, paramsFor(9)), kOk);
+        ASSERT_EQ(a.close(), kOk);
+    }
+    // Cut the last bytes: the extended block's packet now runs past the end of the file.
+    std::vector<uint8_t> f;
+    ASSERT_TRUE(fs::readWholeFile(path, f));
+    f.resize(f.size() - 3);
+    ASSERT_TRUE(fs::writeWholeFile(path, f.data(), f.size()));
+    ScriptedInteraction ui;
+    ui.expect("Extended key block is corrupted\nArchive name '" + path + "'", kAnswerOk);
+    Vaultora a(path, &ui);
+    OpenKey k;
+    k.password = &kPassword;
+    ASSERT_EQ(a.open(k), kOk);
+    EXPECT_EQ(readChain(a, s), data);
+}
+
 // The key packet names Rijndael, but the header and every record were written under Serpent with
 // the same key bytes: the open tries the listed ciphers until the header check passes.
 TEST(PasswordOperations, CipherThatNoLongerMatchesTheKeyPacketIsFoundByTheRecoverySearch) {
