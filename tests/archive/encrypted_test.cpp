@@ -30,6 +30,12 @@ KeyBlockParams paramsFor(uint8_t cipher, uint8_t hash = 8) {
 
 const PasswordRecord kPassword = PasswordRecord::fromUtf8("correct horse");
 
+Result openWith(Vaultora& a, const PasswordRecord& password) {
+    OpenKey key;
+    key.password = &password;
+    return a.open(key);
+}
+
 // Creates an archive with a two-cluster chain and commits it; returns the chain start.
 uint32_t makeArchive(const std::string& path, const KeyBlockParams& params, const std::vector<uint8_t>& data) {
     Vaultora a(path);
@@ -50,9 +56,7 @@ TEST_P(EveryCipher, ArchiveRoundTripsAndOnlyItsPasswordOpensIt) {
 
     ScriptedInteraction ui;
     Vaultora a(path, &ui);
-    OpenKey key;
-    key.password = &kPassword;
-    ASSERT_EQ(a.open(key), kOk);
+    ASSERT_EQ(openWith(a, kPassword), kOk);
     EXPECT_EQ(a.cipherId(), id);
     EXPECT_EQ(readChain(a, s), data);
     a.close();
@@ -61,8 +65,7 @@ TEST_P(EveryCipher, ArchiveRoundTripsAndOnlyItsPasswordOpensIt) {
 
     if (id != 0) {
         const PasswordRecord wrong = PasswordRecord::fromUtf8("correct horsf");
-        key.password = &wrong;
-        EXPECT_EQ(a.open(key), kWrongPassword);
+        EXPECT_EQ(openWith(a, wrong), kWrongPassword);
     }
 }
 
@@ -75,9 +78,7 @@ TEST(EncryptedArchive, EveryHashMakesAnOpenableArchive) {
         auto data = payloadFor(hash, 1000);
         uint32_t s = makeArchive(dir / "a.vra", paramsFor(9, hash), data);
         Vaultora a(dir / "a.vra");
-        OpenKey key;
-        key.password = &kPassword;
-        ASSERT_EQ(a.open(key), kOk) << "hash " << int(hash);
+        ASSERT_EQ(openWith(a, kPassword), kOk) << "hash " << int(hash);
         EXPECT_EQ(readChain(a, s), data);
     }
 }
@@ -118,9 +119,7 @@ TEST(EncryptedArchive, RecordsAndTableDecryptWithPlainCbcAndTheZeroIv) {
     uint32_t recordSize = 0;
     {
         Vaultora a(path);
-        OpenKey k;
-        k.password = &kPassword;
-        ASSERT_EQ(a.open(k), kOk);
+        ASSERT_EQ(openWith(a, kPassword), kOk);
         key = a.archiveKey();
         recordOffset = a.cot()[s].offset;
         recordSize = a.cot()[s].size;
@@ -158,9 +157,7 @@ TEST(PasswordOperations, AddedPasswordOpensAndRemovingItShrinksTheBlock) {
         ui.expectPassword("correct horse").expect("The same password was already used", kAnswerOk)
             .expectPassword("second password");
         Vaultora a(path, &ui);
-        OpenKey k;
-        k.password = &kPassword;
-        ASSERT_EQ(a.open(k), kOk);
+        ASSERT_EQ(openWith(a, kPassword), kOk);
         ASSERT_EQ(addPassword(a, paramsFor(3)), kOk);
         ASSERT_EQ(a.close(), kOk);
     }
@@ -172,20 +169,15 @@ TEST(PasswordOperations, AddedPasswordOpensAndRemovingItShrinksTheBlock) {
             .expect("The password you entered is compatible with Master Key", kAnswerOk)
             .expectPassword("second password");
         Vaultora a(path, &ui);
-        OpenKey k;
-        k.password = &second;
-        ASSERT_EQ(a.open(k), kOk);
+        ASSERT_EQ(openWith(a, second), kOk);
         EXPECT_EQ(readChain(a, s), data);
         ASSERT_EQ(removePassword(a), kOk);
         ASSERT_EQ(a.close(), kOk);
     }
     EXPECT_EQ(fs::fileSize(path), sizeBefore);
     Vaultora a(path);
-    OpenKey k;
-    k.password = &second;
-    EXPECT_EQ(a.open(k), kWrongPassword);
-    k.password = &kPassword;
-    EXPECT_EQ(a.open(k), kOk);
+    EXPECT_EQ(openWith(a, second), kWrongPassword);
+    EXPECT_EQ(openWith(a, kPassword), kOk);
 }
 
 TEST(PasswordOperations, ChangingTheMasterPasswordKeepsTheDataAndDropsTheOldPassword) {
@@ -198,20 +190,15 @@ TEST(PasswordOperations, ChangingTheMasterPasswordKeepsTheDataAndDropsTheOldPass
         ui.expectPassword("not it at all").expect("Session key encrypted by the password was not found.", kAnswerOk)
             .expectPassword("correct horse").expectPassword("brand new password");
         Vaultora a(path, &ui);
-        OpenKey k;
-        k.password = &kPassword;
-        ASSERT_EQ(a.open(k), kOk);
+        ASSERT_EQ(openWith(a, kPassword), kOk);
         ASSERT_EQ(changePassword(a, paramsFor(136)), kOk);
         EXPECT_FALSE(fs::exists(path + ".vrt/~MasterKeyPkt.dat"));
         ASSERT_EQ(a.close(), kOk);
     }
     Vaultora a(path);
-    OpenKey k;
-    k.password = &kPassword;
-    EXPECT_EQ(a.open(k), kWrongPassword);
+    EXPECT_EQ(openWith(a, kPassword), kWrongPassword);
     const PasswordRecord fresh = PasswordRecord::fromUtf8("brand new password");
-    k.password = &fresh;
-    ASSERT_EQ(a.open(k), kOk);
+    ASSERT_EQ(openWith(a, fresh), kOk);
     EXPECT_EQ(readChain(a, s), data);
 }
 
@@ -224,9 +211,7 @@ TEST(PasswordOperations, DamagedExtendedBlockIsReportedAndTheMasterPasswordStill
         ScriptedInteraction ui;
         ui.expectPassword("second password");
         Vaultora a(path, &ui);
-        OpenKey k;
-        k.password = &kPassword;
-        ASSERT_EQ(a.open(k), kOk);
+        ASSERT_EQ(openWith(a, kPassword), kOk);
         ASSERT_EQ(addPassword(a, paramsFor(9)), kOk);
         ASSERT_EQ(a.close(), kOk);
     }
@@ -238,9 +223,7 @@ TEST(PasswordOperations, DamagedExtendedBlockIsReportedAndTheMasterPasswordStill
     ScriptedInteraction ui;
     ui.expect("Extended key block is corrupted\nArchive name '" + path + "'", kAnswerOk);
     Vaultora a(path, &ui);
-    OpenKey k;
-    k.password = &kPassword;
-    ASSERT_EQ(a.open(k), kOk);
+    ASSERT_EQ(openWith(a, kPassword), kOk);
     EXPECT_EQ(readChain(a, s), data);
 }
 
@@ -262,9 +245,7 @@ TEST(PasswordOperations, CipherThatNoLongerMatchesTheKeyPacketIsFoundByTheRecove
         ASSERT_EQ(a.close(), kOk);
     }
     Vaultora a(path);
-    OpenKey k;
-    k.password = &kPassword;
-    ASSERT_EQ(a.open(k), kOk);
+    ASSERT_EQ(openWith(a, kPassword), kOk);
     EXPECT_EQ(a.cipherId(), 137);
     EXPECT_EQ(readChain(a, s), data);
 }
